@@ -1,0 +1,157 @@
+/*
+ * The appliance's core platform library (OLIBC*): per-thread error state, string lists
+ * and hashes, section and key=value files, lock files and process execution.
+ *
+ * Every call that takes a path takes the appliance's own absolute path ("/usr/orlo/etc/
+ * iscsi_lun.conf"); it is mapped under ORLO_SYSROOT by the OS seam when that is set.
+ *
+ * Threads: the error state is per thread.  Lists and hashes are not locked; a container
+ * belongs to one thread at a time.  File operations take no lock of their own: callers
+ * hold the file's lock file around them (OLIBCFileLockTimeByFile).
+ */
+#ifndef OLIBC_H
+#define OLIBC_H
+
+#include <stddef.h>
+#include <stdio.h>
+#include <sys/types.h>
+
+#include "orlo_export.h"
+
+ORLO_EXTERN_C_BEGIN
+
+/* ---- Platform error codes kept in the per-thread error state ---- */
+#define OLIBC_ERR_NONE        0x0000
+#define OLIBC_ERR_OUT_OF_MEM  0x0200  /* an allocation failed */
+#define OLIBC_ERR_ACCESS      0x0600  /* an access() check failed */
+#define OLIBC_ERR_NOT_FOUND   0x0700  /* a file, section or key does not exist */
+#define OLIBC_ERR_FOPEN       0x0900  /* opening a file failed */
+#define OLIBC_ERR_IO          0x0A00  /* reading or writing a file failed */
+#define OLIBC_ERR_BAD_FORMAT  0x0B00  /* a file is not in the expected format */
+#define OLIBC_ERR_MKDIR       0x0C00  /* creating a directory or pid file failed */
+#define OLIBC_ERR_BAD_PARAM   0x0D00  /* a parameter check failed */
+#define OLIBC_ERR_TOO_LONG    0x0E00  /* a value does not fit its buffer */
+#define OLIBC_ERR_NO_SPACE    0x2900  /* the file system is full */
+#define OLIBC_ERR_UNLINK      0x3900  /* unlink failed */
+#define OLIBC_ERR_EXEC        0x3C00  /* a command could not be run or failed */
+#define OLIBC_ERR_BTRFS       0x4100  /* a Btrfs ioctl failed */
+#define OLIBC_ERR_CRYPT       0x5000  /* encryption or decryption failed */
+#define OLIBC_ERR_CONF        0x8100  /* a configuration-file call failed */
+
+ORLO_EXPORT void OLIBCErrSetEx(int code, const char *file, int line);
+ORLO_EXPORT int OLIBCErrGet(void);
+ORLO_EXPORT const char *OLIBCErrorGetFile(void);
+ORLO_EXPORT int OLIBCErrorGetLine(void);
+/* Sets the error state at the caller's own file and line. */
+#define OLIBCErrSet(code) OLIBCErrSetEx((code), __FILE_NAME__, __LINE__)
+
+/* ---- String list: a growable array of owned strings ---- */
+typedef struct _tag_OLIBC_SZLIST {
+    int nAlloc;       /* capacity of ppszItem */
+    int nItem;        /* number of items */
+    char **ppszItem;  /* items, each owned by the list */
+} OLIBC_SZLIST, *POLIBC_SZLIST;
+
+ORLO_EXPORT POLIBC_SZLIST OLIBCSzListAlloc(int capacity);
+ORLO_EXPORT void OLIBCSzListFree(POLIBC_SZLIST pList);
+/* Appends a copy; may grow (and so move) the list.  Returns the new index or -1. */
+ORLO_EXPORT int OLIBCSzListPush(POLIBC_SZLIST *ppList, const char *sz);
+/* Item at idx, or NULL when out of range. */
+ORLO_EXPORT const char *OLIBCSzListGet(const OLIBC_SZLIST *pList, int idx);
+/* Index of the first item equal to sz, or -1. */
+ORLO_EXPORT int OLIBCSzListFind(const OLIBC_SZLIST *pList, const char *sz);
+/* Index of sz in a list sorted ascending (binary search), or -1. */
+ORLO_EXPORT int OLIBCSzListBinaryFind(const OLIBC_SZLIST *pList, const char *sz);
+/* Sorts by strcmp, ascending when descending is 0.  Returns 0 or -1. */
+ORLO_EXPORT int OLIBCSzListSortItems(POLIBC_SZLIST pList, int descending);
+ORLO_EXPORT void OLIBCSzListRemoveAll(POLIBC_SZLIST pList);
+/* Joins the items with sep into buf.  Returns the length, or -1 when it does not fit. */
+ORLO_EXPORT int OLIBCSzListJoin(const OLIBC_SZLIST *pList, const char *sep, char *buf, size_t size);
+/* Removes the last item, copying it into buf when buf is not NULL.  0, or -1 when empty
+ * or when it does not fit (then the item stays). */
+ORLO_EXPORT int OLIBCSzListPop(POLIBC_SZLIST pList, char *buf, size_t size);
+ORLO_EXPORT int OLIBCSzListCount(const OLIBC_SZLIST *pList);
+
+/* ---- String hash: key -> value, iterated in insertion order ---- */
+typedef struct _tag_OLIBC_SZHASH OLIBC_SZHASH, *POLIBC_SZHASH;
+
+ORLO_EXPORT POLIBC_SZHASH OLIBCSzHashAlloc(int capacity);
+ORLO_EXPORT void OLIBCSzHashFree(POLIBC_SZHASH pHash);
+/* Sets or replaces key; may grow the hash.  Returns 0 or -1. */
+ORLO_EXPORT int OLIBCSzHashSetValue(POLIBC_SZHASH *ppHash, const char *key, const char *value);
+/* The value, or NULL when absent. */
+ORLO_EXPORT const char *OLIBCSzHashGetValue(const OLIBC_SZHASH *pHash, const char *key);
+/* Removes key.  1 when removed, 0 when absent. */
+ORLO_EXPORT int OLIBCSzHashRemove(POLIBC_SZHASH pHash, const char *key);
+ORLO_EXPORT void OLIBCSzHashRemoveAll(POLIBC_SZHASH pHash);
+ORLO_EXPORT int OLIBCSzHashCount(const OLIBC_SZHASH *pHash);
+/* The idx-th pair in insertion order: 1 and the pair, or 0 past the end. */
+ORLO_EXPORT int OLIBCSzHashEnum(const OLIBC_SZHASH *pHash, int idx, const char **pKey, const char **pValue);
+
+/* ---- Section files ("[name]" headers with "\tkey=value" lines) and flat key=value files.
+ * Every writer replaces the file atomically: a temporary file beside it, fsync, rename,
+ * owner and mode kept.  Failures set OLIBC_ERR_CONF (or a more precise code). ---- */
+ORLO_EXPORT int OLIBCFileExist(const char *path);   /* 1 for an existing path, else 0 */
+ORLO_EXPORT int OLIBCFileTouch(const char *path);   /* creates an empty file if missing; 0 or negative */
+/* Fills *ppList (allocating it when NULL) with the section names.  Count or negative. */
+ORLO_EXPORT int OLIBCFileEnumSection(const char *path, POLIBC_SZLIST *ppList);
+/* Fills *ppHash (allocating it when NULL) with the section's keys.  Negative on failure,
+ * 0 when the section is absent, 1 when found. */
+ORLO_EXPORT int OLIBCFileGetSection(const char *path, const char *section, POLIBC_SZHASH *ppHash);
+/* Replaces section oldName by newName with the hash's pairs, each written with lineFmt
+ * (two %s: key, value).  1 or more on success; 0 when oldName is absent; negative on failure. */
+ORLO_EXPORT int OLIBCFileSetSection(const char *path, const char *oldName, const char *newName,
+                                    const OLIBC_SZHASH *pHash, const char *lineFmt);
+/* Appends a section.  1 or more on success; negative on failure (also when it exists). */
+ORLO_EXPORT int OLIBCFileAddSection(const char *path, const char *section,
+                                    const OLIBC_SZHASH *pHash, const char *lineFmt);
+/* Removes a section.  1 when removed, 0 when absent, negative on failure. */
+ORLO_EXPORT int OLIBCFileRemoveSection(const char *path, const char *section);
+/* Flat files.  GetKeyValue: the value's length (0 or more) when found, -1 when absent or on
+ * failure (OLIBCErrGet tells which), and a value that does not fit is refused, never cut. */
+ORLO_EXPORT int OLIBCFileGetKeyValue(const char *path, const char *key, char *buf, size_t size);
+/* Sets key with lineFmt ("%s=%s\n" or "%s=\"%s\"\n"), replacing its line or appending one;
+ * creates the file when missing.  0 or negative. */
+ORLO_EXPORT int OLIBCFileSetKeyValue(const char *path, const char *key, const char *value,
+                                     const char *lineFmt);
+/* Reads every key of a flat file into *ppHash (allocating it when NULL).  Count or negative. */
+ORLO_EXPORT int OLIBCFileGetKeys(const char *path, POLIBC_SZHASH *ppHash);
+/* 1 when key holds exactly value, 0 when not (or absent), negative on failure. */
+ORLO_EXPORT int OLIBCFileCheckKeyValue(const char *path, const char *key, const char *value);
+/* One key of one section. Set: 0 or negative (adds the section when absent).
+ * Get: the length when found, -1 when absent or on failure. */
+ORLO_EXPORT int OLIBCFileSetSectionValue(const char *path, const char *section, const char *key,
+                                         const char *value, const char *lineFmt);
+ORLO_EXPORT int OLIBCFileGetSectionValue(const char *path, const char *section, const char *key,
+                                         char *buf, size_t size);
+/* 1 when the line (without its newline) is a section header "[name]", else 0. */
+ORLO_EXPORT int OLIBCIFileIsSection(const char *line, size_t length);
+
+/* ---- Lock files: advisory locks on a file of their own ---- */
+/* Creates the lock file (0600, not following symbolic links) if needed and locks it,
+ * shared or exclusive, waiting up to timeoutSec seconds (-1: for ever, 0: not at all).
+ * Returns 1 with *pHandle set when held, 0 otherwise (*pHandle stays -1). */
+ORLO_EXPORT int OLIBCFileLockTimeByFile(const char *lockPath, int exclusive, int timeoutSec, int *pHandle);
+/* Releases the lock and closes the handle.  0 or -1. */
+ORLO_EXPORT int OLIBCFileUnlockByFile(int handle);
+
+/* ---- Processes, started without a shell; program paths are mapped like files ---- */
+/* Runs path with up to four arguments (the list ends at the first NULL) and waits.
+ * Returns the exit status (0..255), or negative when it could not be run or was killed. */
+ORLO_EXPORT int OLIBCExec(const char *path, const char *arg1, const char *arg2,
+                          const char *arg3, const char *arg4);
+/* Runs argv (argv[0] is the program path, the array ends with NULL) and waits.  As OLIBCExec. */
+ORLO_EXPORT int OLIBCExecv(const char *const argv[]);
+/* Starts path with the NULL-terminated arguments that follow mode and returns a stream on
+ * its standard output ("r") or input ("w"); NULL on failure. */
+ORLO_EXPORT FILE *OLIBCPopen(const char *path, const char *mode, ...);
+ORLO_EXPORT FILE *OLIBCPopenv(const char *const argv[], const char *mode);
+/* Closes a stream of OLIBCPopen and waits: the exit status, or negative. */
+ORLO_EXPORT int OLIBCPclose(FILE *stream);
+/* Forks a child that nobody needs to wait for (it is reaped automatically).
+ * Returns 0 in the child, the child's pid in the parent, -1 on failure. */
+ORLO_EXPORT pid_t OLIBCProcForkChildNoWait(void);
+
+ORLO_EXTERN_C_END
+
+#endif
