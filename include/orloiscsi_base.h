@@ -81,6 +81,10 @@ ORLO_EXPORT uint32_t ORLOiSCSIPutSectionToConfig(const char *path, const char *s
 /* Removes every listed section with its lines (comments inside them are kept), by
  * rewriting the file through a temporary copy. */
 ORLO_EXPORT uint32_t ORLOiSCSIRemoveSectionList(const char *path, const OLIBC_SZLIST *pList);
+/* The lock file that guards a configuration file: the appliance's own files have fixed
+ * lock files under /tmp/iscsi (a volume's copy of the LUN file shares the global one's);
+ * any other file is guarded by /tmp/iscsi/<its name>.lock. */
+ORLO_EXPORT uint32_t ORLOiSCSIConfLockPathGet(const char *path, char *buf, size_t size);
 /* Makes the runtime directories under /tmp/iscsi and, with a volume, its @iSCSI tree. */
 ORLO_EXPORT uint32_t ORLOiSCSIBaseMkdir(const char *volume);
 

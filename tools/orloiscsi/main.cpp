@@ -13,7 +13,7 @@ namespace cli {
 
 namespace {
 
-const Object *const kObjects[] = {&kErrstrObject};
+const Object *const kObjects[] = {&kErrstrObject, &kConfObject};
 
 void PrintMainHelp(FILE *out) {
     fprintf(out,

@@ -1,0 +1,7 @@
+// Path of the "enable" attribute of a block LUN's backstore.
+#include "base/configfs_paths.h"
+#include "orloiscsi_configfs.h"
+
+extern "C" ORLO_EXPORT uint32_t ORLOiSCSIConfigfsBlockEnablePath(const char *name, char *buf, size_t size) {
+    return orlo::BuildBackstorePath(orlo::BackstoreHost::Block, orlo::BackstoreFile::Enable, name, buf, size);
+}

@@ -1,0 +1,7 @@
+// Path of the backstore directory of a LUN being deleted's backstore.
+#include "base/configfs_paths.h"
+#include "orloiscsi_configfs.h"
+
+extern "C" ORLO_EXPORT uint32_t ORLOiSCSIConfigfsTrashLunHbaPath(const char *name, char *buf, size_t size) {
+    return orlo::BuildBackstorePath(orlo::BackstoreHost::Trash, orlo::BackstoreFile::None, name, buf, size);
+}
