@@ -6,7 +6,10 @@
 #include <cstdarg>
 #include <cstdio>
 #include <cstring>
+#include <memory>
+#include <mutex>
 #include <string>
+#include <vector>
 
 namespace {
 struct Sink {
@@ -14,6 +17,10 @@ struct Sink {
     void *ctx;
 };
 std::atomic<Sink *> gSink{nullptr};
+// Every sink ever installed stays allocated until exit: another thread may still be
+// logging through one that has just been replaced.
+std::mutex gSinksMu;
+std::vector<std::unique_ptr<Sink>> gSinks;
 
 // Replaces every "%m" (but not "%%m") with the error text, so that the formatted line
 // reads exactly as syslog would print it.
@@ -40,9 +47,13 @@ std::string ExpandErrno(const char *format, int savedErrno) {
 }  // namespace
 
 void OrloLogSetSink(OrloLogSinkFn sink, void *ctx) {
-    Sink *fresh = sink != nullptr ? new Sink{sink, ctx} : nullptr;
-    // The old sink is leaked on purpose: another thread may still be using it.
-    gSink.exchange(fresh);
+    Sink *fresh = nullptr;
+    if (sink != nullptr) {
+        std::lock_guard<std::mutex> lock(gSinksMu);
+        gSinks.push_back(std::unique_ptr<Sink>(new Sink{sink, ctx}));
+        fresh = gSinks.back().get();
+    }
+    gSink.store(fresh);
 }
 
 void OrloLog(int priority, const char *format, ...) {

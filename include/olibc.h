@@ -152,6 +152,27 @@ ORLO_EXPORT int OLIBCPclose(FILE *stream);
  * Returns 0 in the child, the child's pid in the parent, -1 on failure. */
 ORLO_EXPORT pid_t OLIBCProcForkChildNoWait(void);
 
+/* ---- Plug-ins: executables that other packages install to hear of (and veto) the
+ * library's operations.  For category "lun" and action "lun_create" they live in
+ * /usr/orlo/plugins/lun/lun_create/ and run in name order, each as
+ *     <plugin> <event> <action>
+ * with a JSON description of the object on standard input.  A plug-in that exits
+ * non-zero, is killed, or runs longer than OLIB_PLUGIN_TIMEOUT seconds has failed. ---- */
+#define OLIB_PLUGIN_EVENT_PRE  4
+#define OLIB_PLUGIN_EVENT_POST 5
+#define OLIB_PLUGIN_TIMEOUT    60
+typedef struct _tag_OLIB_PLUGIN OLIB_PLUGIN, *POLIB_PLUGIN;
+/* Collects the plug-ins of category/action.  0, or -1 on bad arguments or allocation. */
+ORLO_EXPORT int OLIBPluginSDKInit(const char *category, const char *action, POLIB_PLUGIN *pHandle);
+/* 1 when handle came from a successful OLIBPluginSDKInit, else 0. */
+ORLO_EXPORT int OLIBPluginHasInit(const OLIB_PLUGIN *handle);
+/* Runs every plug-in for event with json on its input.  The pre-step stops at the first
+ * failure; other events run them all.  0 when all succeeded, else -1 (OLIBC_ERR_EXEC). */
+ORLO_EXPORT int OLIBPluginRun(POLIB_PLUGIN handle, int event, const char *json);
+/* The number of plug-ins found (0 or more). */
+ORLO_EXPORT int OLIBPluginCount(const OLIB_PLUGIN *handle);
+ORLO_EXPORT void OLIBPluginExit(POLIB_PLUGIN handle);
+
 ORLO_EXTERN_C_END
 
 #endif

@@ -54,6 +54,33 @@ ORLO_EXPORT int ORLOVolumeNumGet(const char *path);
 /* Copies a regular file with its mode, replacing dst atomically.  0 or -1. */
 ORLO_EXPORT int ORLOFileCopy(const char *src, const char *dst);
 
+/* The volume number of a "/volumeN..." path (the same rule as ORLOVolumeNumGet);
+ * negative when the path lies on no volume. */
+ORLO_EXPORT int ORLOVolIDParse(const char *path);
+
+/* What the platform knows of the storage a path lies on. */
+typedef struct _tag_ORLO_SPACE_INFO {
+    char szDevice[256];      /* the block device ("/dev/sdb1", "/dev/md2", "/dev/loop3") */
+    char szMountPoint[4096]; /* where it is mounted ("" for an unmounted device) */
+    int fsType;              /* ORLO_FSTYPE_*, -1 for an unmounted device */
+    int isBlockDevice;       /* 1 when szDevice is a block device */
+    unsigned long long totalBytes;
+    unsigned long long freeBytes; /* available to unprivileged writers */
+} ORLO_SPACE_INFO;
+/* For a "/dev/..." path, the device itself; for any other path, the mounted file system
+ * holding it.  1 on success, -1 on failure. */
+ORLO_EXPORT int ORLOSpaceInfoGet(const char *path, ORLO_SPACE_INFO *pInfo);
+/* 1 when the storage object name may be used (enabled), 0 when an administrator has
+ * disabled it: names listed, one a line, in /usr/orlo/etc/space_disabled.conf; -1 when
+ * that file cannot be read. */
+ORLO_EXPORT int ORLOSpaceCanEnable(const char *name);
+/* Tunes the md RAID stripe cache of the array a volume lies on (RAID 5 and 6 have one):
+ * 0 when tuned or when there is nothing to tune, -1 on failure. */
+ORLO_EXPORT int ORLORAIDStripeCacheTune(const char *volume);
+/* Appends an entry to the appliance's event log /var/log/orlo/event.log: time, event id
+ * and up to three texts (NULL for none).  0 or -1. */
+ORLO_EXPORT int ORLOLogSet1(unsigned int eventId, const char *arg1, const char *arg2, const char *arg3);
+
 ORLO_EXTERN_C_END
 
 #endif

@@ -51,6 +51,8 @@ TEST_F(ConfigfsTest, WriteTakesUpTo4095BytesInOneWrite) {
 TEST_F(ConfigfsTest, PrintfAndPutIntegerFormatTheValue) {
     EXPECT_EQ(0u, ORLOiSCSIConfigfsPrintf(kControl, "fd_dev_name=%s,fd_dev_size=%llu", "/volume1/x", 4096ULL));
     EXPECT_EQ("fd_dev_name=/volume1/x,fd_dev_size=4096", ReadFile(kControl));
+    // A plain file keeps old bytes past a shorter write (configfs stores each write whole).
+    WriteFile(kControl, "");
     EXPECT_EQ(0u, ORLOiSCSIConfigfsPutInteger(kControl, -17));
     EXPECT_EQ("-17", ReadFile(kControl));
 

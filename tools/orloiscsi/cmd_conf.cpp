@@ -65,7 +65,7 @@ int RunGet(const Context &ctx, const Args &args) {
     orlo::SzHashGuard hash(OLIBCSzHashAlloc(128));
     if (hash.get() == nullptr) return Fail(ORLO_ERR_OUT_OF_MEMORY);
     int found = OLIBCFileGetSection(args[0].c_str(), args[1].c_str(), hash.addr());
-    if (found < 0) return Fail(ORLO_ERR_GET_SECTION);
+    if (found < 0) return Fail(OLIBCErrGet() == OLIBC_ERR_BAD_PARAM ? ORLO_ERR_BAD_PARAMETER : ORLO_ERR_GET_SECTION);
     if (found == 0) {
         fprintf(stderr, "orloiscsi: no section [%s] in %s\n", args[1].c_str(), args[0].c_str());
         return Fail(ORLO_ERR_GET_SECTION);
@@ -100,7 +100,7 @@ int RunPut(const Context &, const Args &args) {
     if (hash.get() == nullptr) return Fail(ORLO_ERR_OUT_OF_MEMORY);
     // Without --replace the keys given are set and the section's other keys are kept.
     if (!replace && OLIBCFileExist(file) && OLIBCFileGetSection(file, section, hash.addr()) < 0)
-        return Fail(ORLO_ERR_GET_SECTION);
+        return Fail(OLIBCErrGet() == OLIBC_ERR_BAD_PARAM ? ORLO_ERR_BAD_PARAMETER : ORLO_ERR_GET_SECTION);
     for (size_t i = 2; i < rest.size(); ++i) {
         size_t eq = rest[i].find('=');
         if (eq == std::string::npos || eq == 0) {
