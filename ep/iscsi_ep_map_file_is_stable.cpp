@@ -1,0 +1,18 @@
+// Whether a child's relation is stable, that is promoted (child attribute bit 0x4).
+#include "base/iscsi_base_internal.h"
+#include "ep_internal.h"
+
+extern "C" ORLO_EXPORT uint32_t ORLOiSCSIEpMapFileIsStable(const char *mapPath, bool *out) {
+    if (mapPath == nullptr || mapPath[0] == '\0' || out == nullptr) {
+        ORLO_LOG_BAD_PARAMS();
+        return ORLO_ERR_NULL_POINTER;
+    }
+    unsigned char block[EP_BLOCK_SIZE];
+    uint32_t ret = ORLOiSCSIEpFileMapGetVar2(mapPath, block);
+    if (ret != ORLO_OK) {
+        ORLO_LOG_ERR("ORLOiSCSIEpFileMapGetVar2(\"%s\", %p) failed, err=%s", mapPath, static_cast<void *>(block), ORLOiSCSIErrStr(ret));
+        return ret;
+    }
+    *out = (orlo::ep::Get32(block, EP_MAP_VAR2_OFF_CHILD_ATTR) & EP_CHILD_ATTR_PROMOTED) != 0;
+    return ORLO_OK;
+}

@@ -1,0 +1,15 @@
+// The LUN of one name, from the global file.
+#include "base/iscsi_base_internal.h"
+#include "lun/lun_internal.h"
+
+extern "C" ORLO_EXPORT uint32_t ORLOiSCSILunConfGetByLunName(const char *name, uint32_t extraFlags,
+                                                             ORLOiSCSILunList *list) {
+    if (name == nullptr || list == nullptr) {
+        ORLO_LOG_BAD_PARAMS();
+        return ORLO_ERR_NULL_POINTER;
+    }
+    ORLOiSCSILunFilter filter = {};
+    filter.flags = extraFlags | ORLO_ISCSI_LUN_FILTER_LOAD_LUNS | ORLO_ISCSI_LUN_FILTER_NAME;
+    filter.name = name;
+    return ORLOiSCSILunConfLoad(&filter, list);
+}
