@@ -10,6 +10,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <climits>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -68,6 +69,33 @@ bool FindMount(dev_t dev, std::string *mountPoint, std::string *source) {
     return found;
 }
 
+// The mount whose mount point is the longest leading part of realPath.  Btrfs reports
+// a device number of its own for each subvolume in stat, which matches no mount entry,
+// so its mounts are found by path.
+bool FindMountByPath(const std::string &realPath, std::string *mountPoint, std::string *source) {
+    FILE *f = orlo::os::Fopen("/proc/self/mountinfo", "re");
+    if (f == nullptr) return false;
+    char *line = nullptr;
+    size_t cap = 0;
+    bool found = false;
+    while (getline(&line, &cap, f) > 0) {
+        char mnt[4096], src[4096];
+        if (sscanf(line, "%*d %*d %*u:%*u %*s %4095s", mnt) != 1) continue;
+        const char *sep = strstr(line, " - ");
+        if (sep == nullptr || sscanf(sep + 3, "%*s %4095s", src) != 1) continue;
+        std::string point = Unescape(mnt);
+        const bool under = point == "/" || realPath == point ||
+                           (realPath.compare(0, point.size(), point) == 0 && realPath[point.size()] == '/');
+        if (!under || (found && point.size() < mountPoint->size())) continue;
+        *mountPoint = point;
+        *source = Unescape(src);
+        found = true;
+    }
+    free(line);
+    fclose(f);
+    return found;
+}
+
 }  // namespace
 
 extern "C" {
@@ -101,7 +129,9 @@ ORLO_EXPORT int ORLOSpaceInfoGet(const char *path, ORLO_SPACE_INFO *pInfo) {
         return -1;
     }
     std::string mountPoint, source;
-    if (!FindMount(st.st_dev, &mountPoint, &source)) {
+    char real[PATH_MAX];
+    if (!FindMount(st.st_dev, &mountPoint, &source) &&
+        (realpath(orlo::os::Map(path).c_str(), real) == nullptr || !FindMountByPath(real, &mountPoint, &source))) {
         OLIBCErrSet(OLIBC_ERR_NOT_FOUND);
         return -1;
     }

@@ -39,6 +39,8 @@ struct Object {
 // Registered object tables (one per source file).
 extern const Object kErrstrObject;
 extern const Object kConfObject;
+extern const Object kLunObject;
+extern const Object kEpObject;
 
 // Prints "error: <code> <message>" on stderr and returns the exit status 1.
 int Fail(uint32_t code);

@@ -19,8 +19,6 @@ class ConfLock {
   public:
     ConfLock(const char *file, bool exclusive) {
         char lockPath[320];
-        code_ = ORLOiSCSIBaseMkdir(nullptr);
-        if (code_ != ORLO_OK) return;
         code_ = ORLOiSCSIConfLockPathGet(file, lockPath, sizeof(lockPath));
         if (code_ != ORLO_OK) return;
         if (!OLIBCFileLockTimeByFile(lockPath, exclusive ? 1 : 0, kConfLockTimeout, &handle_)) {

@@ -13,7 +13,7 @@ namespace cli {
 
 namespace {
 
-const Object *const kObjects[] = {&kErrstrObject, &kConfObject};
+const Object *const kObjects[] = {&kLunObject, &kEpObject, &kConfObject, &kErrstrObject};
 
 void PrintMainHelp(FILE *out) {
     fprintf(out,
@@ -155,6 +155,12 @@ int main(int argc, char **argv) {
         return 2;
     }
     if (act->name[0] != '\0') ++i;
+    // The runtime directories hold the lock files every action takes; the appliance
+    // makes them at boot, a fresh root may not have them yet.
+    if (obj != &kErrstrObject) {
+        uint32_t ret = ORLOiSCSIBaseMkdir(nullptr);
+        if (ret != ORLO_OK) return Fail(ret);
+    }
     Args args(argv + i, argv + argc);
     for (const std::string &a : args)
         if (IsHelp(a)) {
