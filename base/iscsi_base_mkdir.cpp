@@ -52,7 +52,8 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSIBaseMkdir(const char *volume) {
                 ORLO_LOG_ERR("Failed to create Btrfs subvolume. path: %s", path);
                 return ORLO_ERR_CREATE_SUBVOL;
             }
-            if (orlo::os::Chmod(path, S_IRWXU) != 0) ORLO_LOG_ERR("chmod(\"%s\", S_IRWXU) failed, err=%m", path);
+            if (orlo::os::Chmod(path, S_IRWXU) != 0)
+                ORLO_LOG_ERR("chmod(\"%s\", S_IRWXU) failed, err=%m", path);
             if (ORLOFSSetNodatacow(path) != 0) ORLO_LOG_PLATFORM("ORLOFSSetNodatacow(\"%s\")", path);
         } else if (!MakeDir(path)) {
             ORLO_LOG_ERR("mkdir(\"%s\", S_IRWXU) failed, err=%m", path);

@@ -27,7 +27,8 @@ char gZeros[kZeroChunk];
 bool ProgressStart(uint64_t total) {
     char path[64];
     snprintf(path, sizeof(path), ORLO_ISCSI_FILE_PROGRESS_PATH_FMT, static_cast<int>(getpid()));
-    if (orlo::os::Unlink(path) != 0 && errno != ENOENT) ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", path);
+    if (orlo::os::Unlink(path) != 0 && errno != ENOENT)
+        ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", path);
     char value[32];
     snprintf(value, sizeof(value), "%" PRIu64, total);
     return OLIBCFileSetKeyValue(path, ORLO_ISCSI_FILE_PROGRESS_TOTAL, value, "%s=%s\n") >= 0;

@@ -98,9 +98,11 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSIEpJournalRootPathChange(const char *new
     if (OLIBCFileSetKeyValue(SZF_ORLO_INFO, SZK_JOURNAL_ROOTPATH, root, "%s=\"%s\"\n") < 0) {
         ORLO_LOG_PLATFORM("OLIBCFileSetKeyValue(\"%s\", \"%s\", \"%s\")", SZF_ORLO_INFO, SZK_JOURNAL_ROOTPATH, root);
         // The setting still names the old root: the copy would only be a stray.
-        if (haveOld && orlo::os::Unlink(newPath) != 0) ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", newPath);
+        if (haveOld && orlo::os::Unlink(newPath) != 0)
+            ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", newPath);
         return ORLO_ERR_WRITE_FILE;
     }
-    if (haveOld && orlo::os::Unlink(oldPath) != 0) ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", oldPath);
+    if (haveOld && orlo::os::Unlink(oldPath) != 0)
+        ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", oldPath);
     return ORLO_OK;
 }

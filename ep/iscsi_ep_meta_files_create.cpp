@@ -114,7 +114,8 @@ uint32_t MakeMissing(const char *volume, const char *poolDir, char *uuid, uint32
         }
         ret = MakeMetaFile(mf, path, tmp, uuid, extentSize);
         if (ret != ORLO_OK) {
-            if (orlo::os::Unlink(tmp) != 0 && errno != ENOENT) ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", tmp);
+            if (orlo::os::Unlink(tmp) != 0 && errno != ENOENT)
+                ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", tmp);
             return ret;
         }
     }

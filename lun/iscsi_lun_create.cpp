@@ -387,7 +387,8 @@ void Creation::RemoveSections() {
     char volumeConf[kConfPathSize];
     if (VolumeConfPath(lun_->rootPath, volumeConf, sizeof(volumeConf)) != ORLO_OK) return;
     if (!volumeConfExisted_) {
-        if (orlo::os::Unlink(volumeConf) != 0 && errno != ENOENT) ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", volumeConf);
+        if (orlo::os::Unlink(volumeConf) != 0 && errno != ENOENT)
+            ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", volumeConf);
         return;
     }
     ORLOiSCSILunConfRemoveSection(lun_, volumeConf);
@@ -407,7 +408,8 @@ void Creation::RemovePool() {
     for (auto build : builders) {
         char path[EP_PATH_SIZE];
         if (build(lun_->rootPath, path, sizeof(path)) != ORLO_OK) continue;
-        if (orlo::os::Unlink(path) != 0 && errno != ENOENT) ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", path);
+        if (orlo::os::Unlink(path) != 0 && errno != ENOENT)
+            ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", path);
     }
     char poolDir[EP_PATH_SIZE];
     if (orlo::ep::PoolDirPath(lun_->rootPath, poolDir, sizeof(poolDir)) == ORLO_OK && orlo::os::Rmdir(poolDir) != 0 &&

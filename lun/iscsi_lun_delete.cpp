@@ -124,7 +124,8 @@ uint32_t RemoveLunDir(const ORLOiSCSILun *lun, const char *keep) {
 void RemoveLockFile(const ORLOiSCSILun *lun) {
     char path[kPathSize];
     if (!orlo::lun::LockFilePath(lun, path, sizeof(path))) return;
-    if (orlo::os::Unlink(path) != 0 && errno != ENOENT) ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", path);
+    if (orlo::os::Unlink(path) != 0 && errno != ENOENT)
+        ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", path);
 }
 
 // The steps under the LUN lock; nothing is removed unless the backstore left the kernel.

@@ -63,7 +63,8 @@ uint32_t WriteProgress(const ORLOiSCSILun *lun, int step) {
     }
     // Taking the lock made the file; if nothing is written into it, it goes again.
     auto removeEmpty = orlo::MakeScopeExit([&path]() {
-        if (orlo::os::Unlink(path) != 0 && errno != ENOENT) ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", path);
+        if (orlo::os::Unlink(path) != 0 && errno != ENOENT)
+            ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", path);
     });
     uint64_t total = 0;
     uint32_t ret = TotalBytes(lun, step, &total);

@@ -22,7 +22,8 @@ void RemoveProgress(const ORLOiSCSILun *lun) {
     if (!lock.held()) ORLO_LOG_ERR("Failed to lock file: %s.", path);
     // Removed even without its lock: a progress file outliving its operation would tell
     // readers of an operation that no longer runs.
-    if (orlo::os::Unlink(path) != 0 && errno != ENOENT) ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", path);
+    if (orlo::os::Unlink(path) != 0 && errno != ENOENT)
+        ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", path);
 }
 
 }  // namespace
