@@ -52,10 +52,12 @@ TEST(ErrStr, CodesOutsideEveryBlockFallBackToStrerror) {
 }
 
 TEST(ErrStr, ErrnoValuesPositiveAndNegated) {
-    EXPECT_STREQ(strerror(ENOENT), ORLOiSCSIErrStr(ENOENT));
-    EXPECT_STREQ(strerror(ENOENT), ORLOiSCSIErrStr(static_cast<unsigned int>(-ENOENT)));
-    EXPECT_STREQ(strerror(1), ORLOiSCSIErrStr(static_cast<unsigned int>(-1)));
-    EXPECT_STREQ(strerror(255), ORLOiSCSIErrStr(static_cast<unsigned int>(-255)));
+    // Copies: an unknown number's text lives in a buffer the next strerror call reuses.
+    const std::string noent = strerror(ENOENT), eperm = strerror(1), e255 = strerror(255);
+    EXPECT_EQ(noent, ORLOiSCSIErrStr(ENOENT));
+    EXPECT_EQ(noent, ORLOiSCSIErrStr(static_cast<unsigned int>(-ENOENT)));
+    EXPECT_EQ(eperm, ORLOiSCSIErrStr(static_cast<unsigned int>(-1)));
+    EXPECT_EQ(e255, ORLOiSCSIErrStr(static_cast<unsigned int>(-255)));
     // -256 is not a negated errno: it is passed on unchanged.
     std::string unknown = strerror(-256);
     EXPECT_EQ(unknown, ORLOiSCSIErrStr(0xFFFFFF00u));
