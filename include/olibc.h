@@ -23,7 +23,7 @@ ORLO_EXTERN_C_BEGIN
 /* ---- Platform error codes kept in the per-thread error state ---- */
 #define OLIBC_ERR_NONE        0x0000
 #define OLIBC_ERR_OUT_OF_MEM  0x0200  /* an allocation failed */
-#define OLIBC_ERR_ACCESS      0x0600  /* an access() check failed */
+#define OLIBC_ERR_ACCESS      0x0600  /* an access check failed */
 #define OLIBC_ERR_NOT_FOUND   0x0700  /* a file, section or key does not exist */
 #define OLIBC_ERR_FOPEN       0x0900  /* opening a file failed */
 #define OLIBC_ERR_IO          0x0A00  /* reading or writing a file failed */
@@ -151,6 +151,27 @@ ORLO_EXPORT int OLIBCPclose(FILE *stream);
 /* Forks a child that nobody needs to wait for (it is reaped automatically).
  * Returns 0 in the child, the child's pid in the parent, -1 on failure. */
 ORLO_EXPORT pid_t OLIBCProcForkChildNoWait(void);
+
+/* ---- Cipher for stored secrets (CHAP passwords): AES-256-GCM with a fresh random 96-bit
+ * nonce per call and a 128-bit tag, under the appliance's own 32-byte key.  The key lives in
+ * OLIBC_CRYPT_KEY_PATH (mode 0600, owner only); it is made from the system's random source
+ * on first use, written to a temporary file and renamed into place under the lock file
+ * OLIBC_CRYPT_KEY_LOCK_PATH, so concurrent first users all end up with the same key.
+ *
+ * Stored form: "~" followed by nonce|ciphertext|tag in unpadded base64url ("A-Z a-z 0-9 - _"),
+ * safe as a section-file value.  Its length is 1 + ceil((28 + n) * 4 / 3) for a secret of n
+ * bytes, so a secret of up to OLIBC_CRYPT_PLAIN_MAX (18) bytes fits a 64-byte field; a longer
+ * one is refused (OLIBC_ERR_TOO_LONG), never cut.  An empty secret is stored as "".
+ * Decrypting a stored form that was changed, or made under another key, fails
+ * (OLIBC_ERR_CRYPT).  Both return 0, or -1 with the error state set.  Thread-safe. ---- */
+#define OLIBC_CRYPT_KEY_PATH "/usr/orlo/etc/.iscsi_secret.key"
+#define OLIBC_CRYPT_KEY_LOCK_PATH "/tmp/.iscsi_secret.key.lock"
+#define OLIBC_CRYPT_PLAIN_MAX 18   /* longest secret whose stored form fits 64 bytes */
+#define OLIBC_CRYPT_STORED_MAX 63  /* longest stored form (characters) */
+/* Enciphers the NUL-terminated plain into out (outSize bytes, the stored form and its NUL). */
+ORLO_EXPORT int OLIBCCryptSzEncrypt(const char *plain, char *out, size_t outSize);
+/* Deciphers a stored form into out (outSize bytes, the secret and its NUL). */
+ORLO_EXPORT int OLIBCCryptSzDecrypt(const char *stored, char *out, size_t outSize);
 
 /* ---- Plug-ins: executables that other packages install to hear of (and veto) the
  * library's operations.  For category "lun" and action "lun_create" they live in

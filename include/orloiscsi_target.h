@@ -2,6 +2,15 @@
  * Targets: the iSCSI target records, their access lists and the mappings that make LUNs
  * visible through them.
  *
+ * Targets are the sections "iSCSI_T<tid>" of /usr/orlo/etc/iscsi_target.conf, guarded by
+ * /tmp/iscsi/iscsi_target.conf.lock; access lists are the sections
+ * "iSCSI_ACL_T<tid>_<initiator>" of /usr/orlo/etc/iscsi_acl.conf, guarded by
+ * /tmp/iscsi/iscsi_acl.conf.lock.  Readers hold a file's lock shared, writers exclusive,
+ * waiting up to 60 seconds, per call.  Where both are needed the target file's lock is
+ * taken first.  CHAP secrets are plain text in memory and enciphered in the file
+ * (OLIBCCryptSzEncrypt, olibc.h).  Lists are filled by the loaders and freed by the holder
+ * (ORLOiSCSITargetListFree, ORLOiSCSITargetAclListFree).  See docs/targets.md.
+ *
  * Mappings are the sections "iSCSI_MAP_T<tid>_L<lid>" of /usr/orlo/etc/iscsi_mapping.conf,
  * guarded by /tmp/iscsi/iscsi_mapping.conf.lock (shared for reading, exclusive for
  * writing, 60 seconds).  Every function returns 0 or a result code (orloiscsi_base.h) and
@@ -11,16 +20,204 @@
 #ifndef ORLOISCSI_TARGET_H
 #define ORLOISCSI_TARGET_H
 
+#include <stdbool.h>
 #include <stdint.h>
 
+#include "olibc.h"
 #include "orlo_export.h"
+#include "orloiscsi_list.h"
 
 ORLO_EXTERN_C_BEGIN
+
+/* ---- Sizes and ranges ---- */
+#define ORLO_ISCSI_TID_MIN 1
+#define ORLO_ISCSI_TID_MAX 256
+#define ORLO_ISCSI_TARGET_NAME_SIZE 256       /* name and IQN arrays */
+#define ORLO_ISCSI_TARGET_PORTALS_SIZE 2048
+#define ORLO_ISCSI_TARGET_CHAP_SIZE 64        /* user names and secrets */
+#define ORLO_ISCSI_ISCSI_NAME_MAX 223         /* longest iSCSI name (bytes) */
+#define ORLO_ISCSI_SEG_BYTES_MIN 512          /* data segment lengths the kernel takes */
+#define ORLO_ISCSI_SEG_BYTES_MAX 16777215
+#define ISCSI_TARGET_DEFAULT_TPGT_NUMBER 1
+
+/* Authentication (auth_type). */
+#define ORLO_ISCSI_AUTH_NONE 0
+#define ORLO_ISCSI_AUTH_CHAP 1
+#define ORLO_ISCSI_AUTH_MUTUAL_CHAP 2
+
+/* The target record.  Strings are NUL-terminated inside their arrays. */
+typedef struct _tag_struct_iscsi_target_ {
+    int32_t tid;                /* 1..256; names the section "iSCSI_T<tid>"; key "tid" */
+    bool enabled;               /* wanted in the kernel; "enabled" */
+    bool enabled_as_loaded;     /* "enabled" as read from the file; never written */
+    bool has_header_checksum;   /* CRC32C header digest; "hdr_chksum" */
+    bool has_data_checksum;     /* CRC32C data digest; "data_chksum" */
+    bool bkp_obj;               /* serves a LUN backup; hidden from load-all; "bkp_obj" */
+    char name[ORLO_ISCSI_TARGET_NAME_SIZE];           /* display name; "name" */
+    char iqn[ORLO_ISCSI_TARGET_NAME_SIZE];            /* iSCSI name of the node; "iqn" */
+    char network_portals[ORLO_ISCSI_TARGET_PORTALS_SIZE]; /* "a.b.c.d:port,[v6]:port"; "network_portals" */
+    int32_t max_recv_seg_bytes; /* MaxRecvDataSegmentLength; "recv_seg_bytes" */
+    int32_t max_send_seg_bytes; /* MaxXmitDataSegmentLength; "send_seg_bytes" */
+    int32_t max_sessions;       /* "max_sessions", 1 when absent */
+    int32_t auth_type;          /* ORLO_ISCSI_AUTH_*; "authen" and "mutual" */
+    char user[ORLO_ISCSI_TARGET_CHAP_SIZE];            /* "username" */
+    char password[ORLO_ISCSI_TARGET_CHAP_SIZE];        /* plain; "password" enciphered */
+    char mutual_user[ORLO_ISCSI_TARGET_CHAP_SIZE];     /* "mutual_username" */
+    char mutual_password[ORLO_ISCSI_TARGET_CHAP_SIZE]; /* plain; "mutual_password" enciphered */
+    ORLOiSCSIListLink link;     /* chains the record into a target list */
+} ORLOiSCSITarget;
+
+/* A target list (count and head); records are appended in file order. */
+typedef ORLOiSCSIList ORLOiSCSITargetList;
+/* The record of a link of a target list. */
+#define ORLO_ISCSI_TARGET_OF(linkPtr) ORLO_ISCSI_LIST_ENTRY(linkPtr, ORLOiSCSITarget, link)
+/* for (each ORLOiSCSITarget *targetVar of listPtr); linkVar is an ORLOiSCSIListLink * cursor. */
+#define ORLO_ISCSI_TARGET_LIST_FOREACH(listPtr, linkVar, targetVar)                            \
+    for ((linkVar) = (listPtr)->head.next;                                                     \
+         (linkVar) != &(listPtr)->head && (((targetVar) = ORLO_ISCSI_TARGET_OF(linkVar)), 1);  \
+         (linkVar) = (linkVar)->next)
+
+/* ---- Filter: which target sections a load accepts; every criterion set must hold ---- */
+#define ORLO_ISCSI_TARGET_FILTER_TID 0x0001u      /* "tid" equals tid */
+#define ORLO_ISCSI_TARGET_FILTER_NAME 0x0004u     /* "name" equals name (case-sensitive) */
+#define ORLO_ISCSI_TARGET_FILTER_IQN 0x0008u      /* "iqn" equals iqn */
+#define ORLO_ISCSI_TARGET_FILTER_TID_ARRAY 0x0100u /* "tid" is one of tids[0..tidCount) */
+#define ORLO_ISCSI_TARGET_FILTER_BKP 0x0400u      /* keep backup-object targets in a load-all */
+#define ORLO_ISCSI_TARGET_FILTER_KIND 0x1000u     /* object kind "target" */
+#define ORLO_ISCSI_TARGET_FILTER_ALL 0x7000u      /* exactly (0x200000 aside): every target but backup objects */
+/* Flags 0 accept every section, backup objects included.  The configuration snapshot
+ * fills this from its own filter (tid from lid, tids from lids). */
+typedef struct _tag_ORLO_ISCSI_TARGET_FILTER {
+    uint32_t flags;
+    int32_t tid;
+    const char *name;
+    const char *iqn;
+    const int32_t *tids;
+    int32_t tidCount;
+} ORLOiSCSITargetFilter;
+
+/* ---- Target records and their file ---- */
+
+/* Builds one record (allocated zeroed, freed by the caller with free) from the keys of one
+ * section; secrets are deciphered.  18990033 for a missing required key, 18990705 for a
+ * secret that cannot be deciphered. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetStructCreate(const OLIBC_SZHASH *hash, ORLOiSCSITarget **out);
+/* Checks a record before it is stored or acted on: tid 1..256 (18990710), name (18990700),
+ * IQN a valid iqn./eui./naa. name (18990701), auth_type 0..2 (18990702), max_sessions not
+ * negative (18990703), user names and secrets that fit and read back (18990704..18990707,
+ * secrets at most OLIBC_CRYPT_PLAIN_MAX bytes), segment lengths 512..16777215 (18990738,
+ * 18990739), portals (18990004).  One log line for the first fault. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetStructCheck(const ORLOiSCSITarget *target);
+/* 1 when s is a valid iSCSI name: "iqn.yyyy-mm.<reversed domain>[:<anything>]" in lower
+ * case letters, digits, ".", "-" and ":"; "eui." and 16 hex digits; "naa." and 16 or 32
+ * hex digits; at most 223 bytes.  Else 0. */
+ORLO_EXPORT int ORLOiSCSIIsValidIscsiName(const char *s);
+/* Appends every accepted target of the file to list (a missing file is an empty result).
+ * On failure the list is left empty. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetConfLoad(const ORLOiSCSITargetFilter *filter, ORLOiSCSITargetList *list);
+/* Writes the record's section, replacing the one of its tid when present.  The record is
+ * checked first as by ORLOiSCSITargetStructCheck, except that an auth_type outside 0..2
+ * is logged ("Un-supported CHAP type") and stored as no authentication. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetConfAdd(const ORLOiSCSITarget *target);
+/* Rewrites the existing section of the record's tid (18990000 when it is missing from an
+ * existing file; a missing file is created).  An auth_type outside 0..2 stores empty
+ * "authen" and "mutual" values. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetConfUpdate(const ORLOiSCSITarget *target);
+/* Removes the target's section and then its access-list sections.  0, or -1 with the
+ * reason in the platform error. */
+ORLO_EXPORT int ORLOiSCSITargetConfRemove(const ORLOiSCSITarget *target);
+/* Zeroes list and loads the targets filter accepts; 18990425 when the load fails. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetGetByFilter(const ORLOiSCSITargetFilter *filter, ORLOiSCSITargetList *list);
+/* The targets with that name (flags 0x1004 | extraFlags) or tid (0x1001 | extraFlags);
+ * pass 0x0400 to see backup-object targets in a load-all. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetConfGetByName(const char *name, uint32_t extraFlags, ORLOiSCSITargetList *list);
+ORLO_EXPORT uint32_t ORLOiSCSITargetConfGetByTid(int32_t tid, uint32_t extraFlags, ORLOiSCSITargetList *list);
+/* Copies the first matching target into *target (its link cleared); 18990713 when none,
+ * 18990724 when the query failed. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetGetByName(const char *name, uint32_t extraFlags, ORLOiSCSITarget *target);
+ORLO_EXPORT uint32_t ORLOiSCSITargetGetByTid(int32_t tid, uint32_t extraFlags, ORLOiSCSITarget *target);
+/* The number of targets with that name (0 when free), or -1. */
+ORLO_EXPORT int ORLOiSCSITargetIsNameUsed(const char *name);
+/* The first free name "<prefix>-<k>" for k = 1..1001 into out: 0, or -1 (also when the
+ * name does not fit out; it is never cut). */
+ORLO_EXPORT int ORLOiSCSITargetUnusedNameFind(const char *prefix, char *out, int outSize);
+/* The smallest tid no target (backup objects included) uses, into target->tid; 18990710
+ * when all 256 are taken. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetUnusedTidFind(ORLOiSCSITarget *target);
+/* Removes and frees every record of a target list; NULL is ignored. */
+ORLO_EXPORT void ORLOiSCSITargetListFree(ORLOiSCSITargetList *list);
+
+/* ---- Access lists ---- */
+
+/* What an initiator may do: 0 nothing, 1 read, 3 read and write.  2 is accepted from older
+ * configurations and treated as read-write. */
+typedef enum {
+    ISCSI_TARGET_AUTHORITY_NONE = 0,
+    ISCSI_TARGET_AUTHORITY_RO = 1,
+    ISCSI_TARGET_AUTHORITY_LEGACY_RW = 2,
+    ISCSI_TARGET_AUTHORITY_RW = 3
+} ISCSI_TARGET_AUTHORITY;
+
+/* The initiator name of the default entry, which stands for every initiator not listed
+ * (36 characters). */
+#define ORLO_ISCSI_DEFAULT_ACL_INITIATOR "iqn.2000-01.com.orlo-nas:default.acl"
+
+/* An access-list entry. */
+typedef struct _tag_struct_iscsi_acl_ {
+    int32_t tid;
+    char initiator[ORLO_ISCSI_TARGET_NAME_SIZE];
+    int32_t authority;          /* ISCSI_TARGET_AUTHORITY */
+    ORLOiSCSIListLink link;
+} ORLOiSCSIAcl;
+
+typedef ORLOiSCSIList ORLOiSCSIAclList;
+#define ORLO_ISCSI_ACL_OF(linkPtr) ORLO_ISCSI_LIST_ENTRY(linkPtr, ORLOiSCSIAcl, link)
+#define ORLO_ISCSI_ACL_LIST_FOREACH(listPtr, linkVar, aclVar)                                  \
+    for ((linkVar) = (listPtr)->head.next;                                                     \
+         (linkVar) != &(listPtr)->head && (((aclVar) = ORLO_ISCSI_ACL_OF(linkVar)), 1);        \
+         (linkVar) = (linkVar)->next)
+
+/* Builds one entry (allocated zeroed, freed with free) from the keys of one section: its
+ * "authority"; tid and initiator are the caller's to fill.  18990033 when it is missing. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetAclStructCreate(const OLIBC_SZHASH *hash, ORLOiSCSIAcl **out);
+/* Stores an entry, replacing that initiator's entry of the tid when present.  tid 1..256
+ * (18990710), a valid iSCSI initiator name (18990711), authority 0..3 (18990712). */
+ORLO_EXPORT uint32_t ORLOiSCSITargetConfAclAdd(int32_t tid, const char *initiator, int32_t authority);
+/* Changes the authority of an existing entry; 18990000 when there is none. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetConfAclUpdate(int32_t tid, const char *initiator, ISCSI_TARGET_AUTHORITY authority);
+/* Removes one entry; a missing file or entry is success. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetConfAclRemove(int32_t tid, const char *initiator);
+/* Removes every entry of a tid. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetConfAclsRemove(int32_t tid);
+/* Appends the entries of a tid to list in file order; none is an empty result. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetConfAclLoad(int32_t tid, ORLOiSCSIAclList *list);
+/* Whether that entry is stored (false also when it cannot be read). */
+ORLO_EXPORT bool ORLOiSCSITargetConfAclIsExist(int32_t tid, const char *initiator);
+/* Removes and frees every entry of an access list; NULL is ignored. */
+ORLO_EXPORT void ORLOiSCSITargetAclListFree(ORLOiSCSIAclList *list);
 
 /* Removes every mapping section of LUN lid (1..1024), whatever its target, from the
  * mapping file under the file's lock.  The kernel side is not touched.  A missing file,
  * or a LUN without mappings, is success and leaves the file as it is. */
 ORLO_EXPORT uint32_t ORLOiSCSILunMappingRemove(int32_t lid);
+
+/* ---- Target unload: taking target nodes out of the kernel's iSCSI fabric ----
+ * These work from what configfs holds, not from the configuration files, so they also
+ * clear nodes the files no longer describe and nodes a failed load left half-built.
+ * The tree is dismantled bottom-up; the first failing step ends the unload with its
+ * code and what was removed stays removed, so repeating the call carries on.  Paths
+ * are configfs paths such as "/config/target/iscsi/<iqn>/tpgt_1". */
+/* Unloads the node /config/target/iscsi/<iqn>; a node that is not there is success. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetUnloadByIqn(const char *iqn);
+/* Unloads a node directory: for each portal group, switch it off, remove its portals,
+ * node access lists and LUN entries and the group; then the node itself. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetUnloadByConfigfsPath(const char *node_path);
+/* Removes every portal under <tpg_path>/np. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetPortalGroupNpUnload(const char *tpg_path);
+/* Removes a node access list directory: its LUN entries lose their links and go first. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetPortalGroupNodeAclRemove(const char *acl_path);
+/* Removes a portal-group LUN entry: its backstore link, then the entry. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetPortalGroupLunRemoveEntry(const char *lun_path);
 
 ORLO_EXTERN_C_END
 

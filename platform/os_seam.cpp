@@ -295,5 +295,24 @@ int DeleteModule(const char *name, unsigned int flags) {
     return 0;
 }
 
+int ModuleLoaded(const char *name) {
+    if (name == nullptr || name[0] == '\0') {
+        errno = EINVAL;
+        return -1;
+    }
+    // /proc/modules lines start with the name and a blank; the simulator lists one
+    // name a line.
+    FILE *f = SysRoot().empty() ? ::fopen("/proc/modules", "re") : Fopen("/config/.sim/modules", "re");
+    if (f == nullptr) return -1;
+    char line[512];
+    size_t n = strlen(name);
+    int found = 0;
+    while (found == 0 && fgets(line, sizeof(line), f) != nullptr) {
+        if (strncmp(line, name, n) == 0 && (line[n] == ' ' || line[n] == '\n' || line[n] == '\0')) found = 1;
+    }
+    fclose(f);
+    return found;
+}
+
 }  // namespace os
 }  // namespace orlo

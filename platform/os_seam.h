@@ -72,6 +72,10 @@ int Run(const std::vector<std::string> &argv);
 // The kernel's delete-module call.  Under a sandbox root it is answered by the
 // simulated kernel target (its control file /config/.sim/modules).
 int DeleteModule(const char *name, unsigned int flags);
+// 1 when the kernel has the module inserted, 0 when not, -1 (errno set) when the
+// module table cannot be read: /proc/modules, or under a sandbox root the simulated
+// kernel target's table.
+int ModuleLoaded(const char *name);
 
 }  // namespace os
 }  // namespace orlo

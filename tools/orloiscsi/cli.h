@@ -41,6 +41,8 @@ extern const Object kErrstrObject;
 extern const Object kConfObject;
 extern const Object kLunObject;
 extern const Object kEpObject;
+extern const Object kModulesObject;
+extern const Object kServiceObject;
 
 // Prints "error: <code> <message>" on stderr and returns the exit status 1.
 int Fail(uint32_t code);

@@ -13,7 +13,8 @@ namespace cli {
 
 namespace {
 
-const Object *const kObjects[] = {&kLunObject, &kEpObject, &kConfObject, &kErrstrObject};
+const Object *const kObjects[] = {&kLunObject,     &kEpObject,   &kServiceObject,
+                                  &kModulesObject, &kConfObject, &kErrstrObject};
 
 void PrintMainHelp(FILE *out) {
     fprintf(out,

@@ -1,0 +1,13 @@
+// Inserts a module set under the service lock.
+#include "base/iscsi_base_internal.h"
+#include "orloiscsi_service.h"
+
+extern "C" ORLO_EXPORT uint32_t ORLOiSCSILoadModules(int module_set) {
+    ORLOiSCSIServiceLockGuard guard;
+    if (!guard.held()) return ORLO_ERR_LOCK_FILE;
+    uint32_t ret = ORLOiSCSILoadModulesWithoutLock(module_set);
+    if (ret != ORLO_OK) {
+        ORLO_LOG_ERR("ORLOiSCSILoadModulesWithoutLock(module_set) failed, err=%s", ORLOiSCSIErrStr(ret));
+    }
+    return ret;
+}

@@ -1,0 +1,77 @@
+// orloiscsi modules and service version: the kernel target's module sets and the
+// target-core generation in use.
+#include <strings.h>
+
+#include <cstdio>
+#include <string>
+
+#include "cli.h"
+#include "orloiscsi_configfs.h"
+#include "orloiscsi_service.h"
+
+namespace cli {
+
+namespace {
+
+struct SetName {
+    const char *name;
+    int set;
+};
+const SetName kSets[] = {
+    {"iscsi", ISCSI_KERNEL_MODULES},
+    {"vhost", VHOST_KERNEL_MODULES},
+    {"tcm", TCM_KERNEL_MODULES},
+    {"loopback", LOOPBACK_KERNEL_MODULES},
+};
+
+bool ParseSet(const std::string &s, int *set) {
+    for (const SetName &n : kSets)
+        if (strcasecmp(s.c_str(), n.name) == 0 || s == std::to_string(n.set)) {
+            *set = n.set;
+            return true;
+        }
+    return false;
+}
+
+int RunModules(const Args &args, size_t actionIndex, uint32_t (*op)(int), const char *done) {
+    int set = 0;
+    if (args.size() != 1 || !ParseSet(args[0], &set)) return Usage(kModulesObject, kModulesObject.actions[actionIndex]);
+    uint32_t ret = op(set);
+    if (ret != 0) return Fail(ret);
+    printf("%s module set %s\n", done, args[0].c_str());
+    return 0;
+}
+
+int RunLoad(const Context &, const Args &args) { return RunModules(args, 0, ORLOiSCSILoadModules, "loaded"); }
+int RunUnload(const Context &, const Args &args) { return RunModules(args, 1, ORLOiSCSIUnloadModules, "unloaded"); }
+
+const Action kModuleActions[] = {
+    {"load", "iscsi|vhost|tcm|loopback",
+     "insert the target-core modules and then the set's own (modules already in are kept)", RunLoad},
+    {"unload", "iscsi|vhost|tcm|loopback",
+     "remove the set's modules, last first (tcm removes the target core itself)", RunUnload},
+    {nullptr, nullptr, nullptr, nullptr},
+};
+
+int RunVersion(const Context &ctx, const Args &args) {
+    if (!args.empty()) return Usage(kServiceObject, kServiceObject.actions[0]);
+    unsigned int v = ORLOiSCSIGetLioVersion();
+    const char *name = v == 4 ? "lio4x" : v == 0 ? "none" : "lio";
+    if (ctx.json)
+        printf("{\"version\":%u,\"name\":\"%s\"}\n", v, name);
+    else
+        printf("%u %s\n", v, name);
+    return 0;
+}
+
+const Action kServiceActions[] = {
+    {"version", "", "the target-core generation in use: 4 (lio4x), 2 (lio) or 0 (no iSCSI target)", RunVersion},
+    {nullptr, nullptr, nullptr, nullptr},
+};
+
+}  // namespace
+
+const Object kModulesObject = {"modules", "the kernel target's module sets, under the service lock", kModuleActions};
+const Object kServiceObject = {"service", "the iSCSI service as a whole", kServiceActions};
+
+}  // namespace cli
