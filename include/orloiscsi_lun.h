@@ -131,6 +131,14 @@ typedef struct _tag_ORLO_ISCSI_LUN_FILTER {
     const char *uuid;
     const int32_t *lids;
     int32_t lidCount;
+    /* Target and mapping criteria, read by the configuration snapshot (orloiscsi_conf.h):
+     * 0x0001 tid, 0x0004 target name (in name), 0x0008 iqn, 0x0100 tids[0..tidCount),
+     * 0x0040 mapping LUN number. */
+    int32_t tid;
+    int32_t lun;
+    const char *iqn;
+    const int32_t *tids;
+    int32_t tidCount;
 } ORLOiSCSILunFilter;
 
 /* ---- Type names ---- */
@@ -147,6 +155,10 @@ ORLO_EXPORT uint32_t ORLOiSCSILunConfLoadByPath(const ORLOiSCSILunFilter *filter
                                                 const char *path);
 /* The same on /usr/orlo/etc/iscsi_lun.conf. */
 ORLO_EXPORT uint32_t ORLOiSCSILunConfLoad(const ORLOiSCSILunFilter *filter, ORLOiSCSILunList *list);
+/* The LUNs of a configuration snapshot (ORLOiSCSIConfGet) taken with filter, appended to
+ * list; with 0x200 only those a loaded mapping points to.  On failure the list is left
+ * empty. */
+ORLO_EXPORT uint32_t ORLOiSCSILunConfLoadByFilter(const ORLOiSCSILunFilter *filter, ORLOiSCSILunList *list);
 /* Every LUN (flags 0x7000 | extraFlags: backup objects only with 0x400). */
 ORLO_EXPORT uint32_t ORLOiSCSILunConfGetAll(ORLOiSCSILunList *list, uint32_t extraFlags);
 /* The LUN with that lid (flags 0x2020 | extraFlags). */

@@ -1,5 +1,6 @@
 /*
- * Service control: the service lock and the kernel target's module sets.
+ * Service control: the service lock, the kernel target's module sets and stopping the
+ * whole service.
  *
  * The service lock (/tmp/tcm_service_state.lock, exclusive, no time limit) serialises
  * every kernel-wide operation among processes: starting and stopping the service,
@@ -18,6 +19,7 @@
 #ifndef ORLOISCSI_SERVICE_H
 #define ORLOISCSI_SERVICE_H
 
+#include <stdbool.h>
 #include <stdint.h>
 
 #include "orlo_export.h"
@@ -48,6 +50,42 @@ ORLO_EXPORT uint32_t ORLOiSCSILoadModules(int module_set);
  * removal ends the walk with 18990031. */
 ORLO_EXPORT uint32_t ORLOiSCSIUnloadModulesWithoutLock(int module_set);
 ORLO_EXPORT uint32_t ORLOiSCSIUnloadModules(int module_set);
+
+/* ---- Stopping the service ----
+ *
+ * The stops work from what the kernel's configfs tree holds, not from the configuration
+ * files, so they also clear objects the files no longer know.  None of them changes a
+ * configuration file.  Each goes on past a failing object and returns the first
+ * failure; whatever was taken out stays out, and a repeated stop carries on from there.
+ * Something already gone, or a fabric whose module is not in, is success. */
+
+/* Stops the LUN-backup daemon (/bin/killall orlolunbkp); its failure is logged as
+ * "ORLOLunBackupStop() failed" and returned.  No service lock. */
+ORLO_EXPORT uint32_t ORLOiSCSIStopMiscService(void);
+/* The misc stop (failure only logged), then every target node under
+ * /config/target/iscsi taken out with ORLOiSCSITargetUnloadByConfigfsPath. */
+ORLO_EXPORT uint32_t ORLOiSCSIStopAllWithoutLock(void);
+ORLO_EXPORT uint32_t ORLOiSCSIStopAll(void);
+/* Every node of /config/target/vhost, resp. /config/target/loopback: each portal group's
+ * nexus dropped, its LUN entries unlinked and removed, then the group and the node. */
+ORLO_EXPORT uint32_t ORLOiSCSIVhostStopAllWithoutLock(void);
+ORLO_EXPORT uint32_t ORLOiSCSIVhostStopAll(void);
+ORLO_EXPORT uint32_t ORLOiSCSILoopbackStopAllWithoutLock(void);
+/* Loads every LUN of /usr/orlo/etc/iscsi_lun.conf (backup objects too) with
+ * ORLOiSCSILunLoad; a failing LUN is logged and the others still loaded. */
+ORLO_EXPORT uint32_t ORLOiSCSILunServiceStartAllWithoutLock(void);
+/* Takes every backstore under the target-core hosts (/config/target/core/<host>/<name>)
+ * out of the kernel.  One that a fabric LUN entry still links to is left in and counted
+ * as 18990534 "LUN is mapped"; one the kernel refuses (a virtual LUN's hold) likewise. */
+ORLO_EXPORT uint32_t ORLOiSCSILunServiceStopAllWithoutLock(void);
+ORLO_EXPORT uint32_t ORLOiSCSILunServiceStopAll(void);
+/* Under the service lock: stop all, loopback, vhost, LUN backstores, then the module sets
+ * 1, 4, 2, 3.  Every step runs whatever the one before returned; the first failure is
+ * returned. */
+ORLO_EXPORT uint32_t ORLOiSCSITotallyStopAndUnload(void);
+/* *in_use is set when the configuration holds any LUN or any target (backup objects
+ * left out): then the service has something to serve.  No service lock. */
+ORLO_EXPORT uint32_t ORLOiSCSIServiceIsInUse(bool *in_use);
 
 ORLO_EXTERN_C_END
 

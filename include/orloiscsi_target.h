@@ -196,6 +196,47 @@ ORLO_EXPORT bool ORLOiSCSITargetConfAclIsExist(int32_t tid, const char *initiato
 /* Removes and frees every entry of an access list; NULL is ignored. */
 ORLO_EXPORT void ORLOiSCSITargetAclListFree(ORLOiSCSIAclList *list);
 
+/* ---- Mappings: LUN lid seen through target tid as LUN number lun ---- */
+#define ORLO_ISCSI_MAPPING_LUN_MAX 255        /* LUN numbers are 0..255 */
+#define ORLO_ISCSI_MAPPINGS_PER_TARGET_MAX 256
+/* Mapping criterion of the load filter (the others are the tid bit 0x0001 and the lid bit
+ * 0x0020 of the LUN filter): the section's "lun" equals the filter's lun. */
+#define ORLO_ISCSI_MAPPING_FILTER_LUN 0x0040u
+
+struct _tag_ORLO_ISCSI_LUN;
+
+/* The mapping record: one section "iSCSI_MAP_T<tid>_L<lid>" with the keys "tid", "lid"
+ * and "lun".  Allocated zeroed; held by a configuration snapshot (orloiscsi_conf.h), which
+ * points pLun and pTrg at its own LUN and target records (NULL while unresolved). */
+typedef struct _tag_struct_iscsi_mapping_ {
+    int32_t lun;                      /* LUN number seen by initiators, 0..255; "lun" */
+    int32_t lid;                      /* 1..1024; "lid" */
+    int32_t tid;                      /* 1..256; "tid" */
+    struct _tag_ORLO_ISCSI_LUN *pLun; /* the LUN record of the same snapshot, or NULL */
+    ORLOiSCSITarget *pTrg;            /* the target record of the same snapshot, or NULL */
+    ORLOiSCSIListLink link;           /* chains the record into a mapping list */
+} ORLOiSCSIMapping;
+
+/* A mapping list (count and head), in file order. */
+typedef ORLOiSCSIList ORLOiSCSIMappingList;
+#define ORLO_ISCSI_MAPPING_OF(linkPtr) ORLO_ISCSI_LIST_ENTRY(linkPtr, ORLOiSCSIMapping, link)
+#define ORLO_ISCSI_MAPPING_LIST_FOREACH(listPtr, linkVar, mapVar)                              \
+    for ((linkVar) = (listPtr)->head.next;                                                     \
+         (linkVar) != &(listPtr)->head && (((mapVar) = ORLO_ISCSI_MAPPING_OF(linkVar)), 1);    \
+         (linkVar) = (linkVar)->next)
+
+/* Builds one record (allocated zeroed, freed with free) from the keys of one section;
+ * "tid", "lid" and "lun" are all required (18990033). */
+ORLO_EXPORT uint32_t ORLOiSCSITargetMappingObjectCreate(const OLIBC_SZHASH *hash, ORLOiSCSIMapping **out);
+/* Writes the section of the mapping (tid 1..256, lid 1..1024, lun 0..255; else 18990004),
+ * replacing the one of that tid and lid when present.  The kernel is not touched. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetConfMappingAdd(int32_t tid, int32_t lid, int32_t lun);
+/* Removes the section of that tid and lid; a missing file or section is success.  The
+ * kernel is not touched. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetConfMappingRemove(int32_t tid, int32_t lid);
+/* Loading mappings and linking them to their records: ORLOiSCSITargetConfMappingLoad and
+ * ORLOiSCSITargetConfMappingMake work on a configuration snapshot (orloiscsi_conf.h). */
+
 /* Removes every mapping section of LUN lid (1..1024), whatever its target, from the
  * mapping file under the file's lock.  The kernel side is not touched.  A missing file,
  * or a LUN without mappings, is success and leaves the file as it is. */

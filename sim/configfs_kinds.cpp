@@ -952,9 +952,35 @@ std::vector<Kind> BuildTable() {
     fabric.name = "fabric_iscsi";
     fabric.makeChild = IqnName("iscsi_node");
     add(fabric);
+    // The vhost and loopback fabrics: nodes ("naa." names) with portal groups that carry
+    // an I_T nexus and LUN entries linked to backstores, like the iSCSI fabric's.
     Kind other;
     other.name = "fabric_other";
+    other.makeChild = AnyName("other_node");
     add(other);
+    Kind otherNode;
+    otherNode.name = "other_node";
+    otherNode.makeChild = Numbered("tpgt_", 0xFFFF, "other_tpg");
+    add(otherNode);
+    Kind otherTpg;
+    otherTpg.name = "other_tpg";
+    // "NULL" drops the nexus (ENODEV when there is none); a name makes one (EEXIST when
+    // there is one already).
+    otherTpg.attrs = {Custom("nexus", 0644, "", [](Sim &, Node &n, int attr, const std::string &in) {
+        std::string &v = n.values[static_cast<size_t>(attr)];
+        std::string want = Chomp(in);
+        if (want == "NULL") {
+            if (v.empty()) return ENODEV;
+            v.clear();
+            return 0;
+        }
+        if (want.compare(0, 4, "naa.") != 0) return EINVAL;
+        if (!v.empty()) return EEXIST;
+        v = want;
+        return 0;
+    })};
+    otherTpg.groups = {{"lun", "tpg_lun_dir"}};
+    add(otherTpg);
 
     Kind node;
     node.name = "iscsi_node";
