@@ -22,7 +22,8 @@ const char kInsmod[] = "/sbin/insmod";
 // than absence is logged and counts as absent, since nothing can be inserted from it.
 bool ModuleFileExists(const std::string &file) {
     if (os::Access(file.c_str(), F_OK) == 0) return true;
-    if (errno != ENOENT) ORLO_LOG_ERR("access(\"%s\", F_OK) failed, err=%m", file.c_str());
+    if (errno != ENOENT)
+        ORLO_LOG_ERR("access(\"%s\", F_OK) failed, err=%m", file.c_str());
     return false;
 }
 
