@@ -1,5 +1,6 @@
 // orloiscsi modules and service version against the simulated kernel target.
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 
 #include <algorithm>
 #include <string>
@@ -45,6 +46,23 @@ TEST_F(OrloiscsiModules, SetsGoInAndOutAndTheVersionIsShown) {
     EXPECT_TRUE(Modules().empty());
 
     EXPECT_EQ(2, Cli({"modules", "load", "fc"}, &out, &err));
+}
+
+TEST_F(OrloiscsiModules, ServiceStopAndTotalStopEmptyTheKernel) {
+    std::string out, err;
+    WriteFile("/etc.defaults/orloinfo.conf", "support_iscsi_target=\"yes\"\niscsi_target_type=\"lio4x\"\n");
+    ASSERT_EQ(0, Cli({"modules", "load", "iscsi"}, &out, &err)) << err;
+    // A node no file knows, with a portal group: the stop walks the kernel's tree.
+    ASSERT_EQ(0, mkdir(Cfg("/target/iscsi").c_str(), 0755));
+    ASSERT_EQ(0, mkdir(Cfg("/target/iscsi/iqn.2000-01.com.example:stray").c_str(), 0755));
+    ASSERT_EQ(0, mkdir(Cfg("/target/iscsi/iqn.2000-01.com.example:stray/tpgt_1").c_str(), 0755));
+    EXPECT_EQ(0, Cli({"service", "in-use"}, &out, &err)) << err;
+    EXPECT_EQ("not in use\n", out);
+    ASSERT_EQ(0, Cli({"service", "stop"}, &out, &err)) << err;
+    EXPECT_FALSE(Exists("/config/target/iscsi/iqn.2000-01.com.example:stray"));
+    EXPECT_TRUE(In("iscsi_target_mod")) << "stop keeps the modules";
+    ASSERT_EQ(0, Cli({"service", "total-stop"}, &out, &err)) << err;
+    EXPECT_TRUE(Modules().empty());
 }
 
 }  // namespace

@@ -64,8 +64,40 @@ int RunVersion(const Context &ctx, const Args &args) {
     return 0;
 }
 
+int RunStep(const Args &args, size_t actionIndex, uint32_t (*op)(void), const char *done) {
+    if (!args.empty()) return Usage(kServiceObject, kServiceObject.actions[actionIndex]);
+    uint32_t ret = op();
+    if (ret != 0) return Fail(ret);
+    printf("%s\n", done);
+    return 0;
+}
+
+int RunStop(const Context &, const Args &args) {
+    return RunStep(args, 1, ORLOiSCSIStopAll, "stopped: every target node is out of the kernel");
+}
+
+int RunTotalStop(const Context &, const Args &args) {
+    return RunStep(args, 2, ORLOiSCSITotallyStopAndUnload, "stopped and unloaded: no target node, backstore or module left");
+}
+
+int RunInUse(const Context &ctx, const Args &args) {
+    if (!args.empty()) return Usage(kServiceObject, kServiceObject.actions[3]);
+    bool inUse = false;
+    uint32_t ret = ORLOiSCSIServiceIsInUse(&inUse);
+    if (ret != 0) return Fail(ret);
+    if (ctx.json)
+        printf("{\"in_use\":%s}\n", inUse ? "true" : "false");
+    else
+        printf("%s\n", inUse ? "in use" : "not in use");
+    return 0;
+}
+
 const Action kServiceActions[] = {
     {"version", "", "the target-core generation in use: 4 (lio4x), 2 (lio) or 0 (no iSCSI target)", RunVersion},
+    {"stop", "", "take every target node out of the kernel (the files are kept)", RunStop},
+    {"total-stop", "", "stop, take every backstore out, and remove the module sets (iscsi, loopback, vhost, tcm)",
+     RunTotalStop},
+    {"in-use", "", "whether the configuration holds any LUN or target", RunInUse},
     {nullptr, nullptr, nullptr, nullptr},
 };
 
