@@ -260,6 +260,20 @@ ORLO_EXPORT uint32_t ORLOiSCSITargetPortalGroupNodeAclRemove(const char *acl_pat
 /* Removes a portal-group LUN entry: its backstore link, then the entry. */
 ORLO_EXPORT uint32_t ORLOiSCSITargetPortalGroupLunRemoveEntry(const char *lun_path);
 
+/* ---- iSNS client ----
+ * Targets are announced to an iSNS server when /usr/orlo/etc/isns.conf says
+ * isns_enable=yes (key=value lines; the server in isns_server).  iSNS is off unless that
+ * file turns it on; while it is off these calls do nothing, succeed and report the
+ * client not connected.  The iSNS protocol itself is not built yet: with iSNS on,
+ * connecting reports 18990213 "Not implemented yet" and the client stays disconnected. */
+ORLO_EXPORT bool ORLOiSCSIiSNSIsEnabled(void);
+ORLO_EXPORT uint32_t ORLOiSCSIiSNSConnect(void);
+ORLO_EXPORT bool ORLOiSCSIiSNSIsConnected(void);
+ORLO_EXPORT uint32_t ORLOiSCSIiSNSDisconnect(void);
+/* Best effort: callers never check these. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetiSNSRegister(const ORLOiSCSITarget *target);
+ORLO_EXPORT uint32_t ORLOiSCSITargetiSNSDeregister(const ORLOiSCSITarget *target);
+
 ORLO_EXTERN_C_END
 
 #endif
