@@ -1,6 +1,7 @@
 #include "base/configfs_paths.h"
 
 #include <cstdio>
+#include <cstring>
 
 #include "base/iscsi_base_internal.h"
 #include "service/lio_version.h"
@@ -43,6 +44,12 @@ uint32_t BuildBackstorePath(BackstoreHost host, BackstoreFile file, const char *
         return ORLO_ERR_PARSE_STRING;
     }
     return ORLO_OK;
+}
+
+const char *ConfigfsLogValue(const char *path, const char *value) {
+    const char *leaf = strrchr(path, '/');
+    leaf = leaf != nullptr ? leaf + 1 : path;
+    return strncmp(leaf, "password", 8) == 0 ? "********" : value;
 }
 
 }  // namespace orlo

@@ -21,6 +21,10 @@ uint32_t GetLUNConfigFSPath(const char *host, const char *name, char *buf, size_
 // when the path does not fit; both logged.
 uint32_t BuildBackstorePath(BackstoreHost host, BackstoreFile file, const char *name, char *buf, size_t size);
 
+// The value of an attribute as a log line may show it: CHAP secrets ("password" and
+// "password_mutual" under auth/) are shown as "********".
+const char *ConfigfsLogValue(const char *path, const char *value);
+
 }  // namespace orlo
 
 #endif

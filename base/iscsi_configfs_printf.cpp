@@ -2,6 +2,7 @@
 #include <cstdarg>
 #include <cstdio>
 
+#include "base/configfs_paths.h"
 #include "base/iscsi_base_internal.h"
 #include "orloiscsi_configfs.h"
 
@@ -23,6 +24,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSIConfigfsPrintf(const char *path, const 
         return ORLO_ERR_PARSE_STRING;
     }
     uint32_t ret = ORLOiSCSIConfigfsWrite(path, buf);
-    if (ret != ORLO_OK) ORLO_LOG_ERR("ORLOiSCSIConfigfsWrite(\"%s\", \"%s\") failed, err=%s", path, buf, ORLOiSCSIErrStr(ret));
+    if (ret != ORLO_OK) ORLO_LOG_ERR("ORLOiSCSIConfigfsWrite(\"%s\", \"%s\") failed, err=%s", path, orlo::ConfigfsLogValue(path, buf),
+                                  ORLOiSCSIErrStr(ret));
     return ret;
 }

@@ -5,6 +5,7 @@
 #include <cerrno>
 #include <cstring>
 
+#include "base/configfs_paths.h"
 #include "base/iscsi_base_internal.h"
 #include "orloiscsi_configfs.h"
 #include "platform/os_seam.h"
@@ -30,7 +31,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSIConfigfsWrite(const char *path, const c
         ssize_t n = write(fd, text, len);
         if (n < 0 || static_cast<size_t>(n) != len) {
             if (n >= 0) errno = EIO;
-            ORLO_LOG_ERR("write(%d, \"%s\", %zu) failed, err=%m", fd, text, len);
+            ORLO_LOG_ERR("write(%d, \"%s\", %zu) failed, err=%m", fd, orlo::ConfigfsLogValue(path, text), len);
             ret = ORLO_ERR_WRITE_FILE;
         }
     }

@@ -274,6 +274,30 @@ ORLO_EXPORT uint32_t ORLOiSCSIiSNSDisconnect(void);
 ORLO_EXPORT uint32_t ORLOiSCSITargetiSNSRegister(const ORLOiSCSITarget *target);
 ORLO_EXPORT uint32_t ORLOiSCSITargetiSNSDeregister(const ORLOiSCSITarget *target);
 
+/* ---- Access lists in the kernel: node access lists, their LUN entries and CHAP ----
+ * Paths lie under "/config/target/iscsi/<iqn>/tpgt_<tpgt>/acls/<initiator>".  The default
+ * entry (ORLO_ISCSI_DEFAULT_ACL_INITIATOR) gets a node access list of its own only under
+ * the older target core (version 2); elsewhere the portal group's demo-mode attributes
+ * stand for it.  Write protection: an initiator writes only with read-write authority (3,
+ * or 2) on a volume that is not mounted read-only; anything else is protected.  Bad
+ * arguments give 18990003 / 18990004; a path that does not fit 320 bytes 18990050. */
+/* Makes the initiator's node access list (an existing one is kept); 18990028. */
+ORLO_EXPORT uint32_t ORLOiSCSILioTargetNodeAclAdd(const char *iqn, int tpgt, const char *initiator);
+/* Makes the initiator's entry lun_<lun> and links it as "lio_lun" to the group's
+ * lun/lun_<lun>, which must be linked to a backstore.  An entry made here is removed
+ * again when the link fails. */
+ORLO_EXPORT uint32_t ORLOiSCSILioTargetLunAclInitiatorAdd(const char *iqn, int tpgt, const char *initiator, int lun);
+/* Removes the "lio_lun" link and the entry; what is already gone counts as removed. */
+ORLO_EXPORT uint32_t ORLOiSCSILioTargetLunAclInitiatorRemove(const char *iqn, int tpgt, const char *initiator, int lun);
+/* Writes the entry's write_protect from entry->authority and the read-only state of the
+ * volume of the LUN linked under lun/lun_<lun> (18990011 when none is linked). */
+ORLO_EXPORT uint32_t ORLOiSCSILioTargetLunInitiatorRw(const char *iqn, int tpgt, const ORLOiSCSIAcl *entry, int lun);
+/* Writes the target's CHAP credentials into the "auth" directory of the node access list
+ * of every stored entry of its tid: kind 1 userid and password, kind 2 also
+ * userid_mutual and password_mutual.  Another kind is refused with 18990004 as soon as
+ * an entry would need it; an empty access list writes nothing. */
+ORLO_EXPORT uint32_t ORLOiSCSILioTargetMaskingsChapAuthAdd(const ORLOiSCSITarget *target, int kind);
+
 ORLO_EXTERN_C_END
 
 #endif

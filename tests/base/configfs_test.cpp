@@ -198,3 +198,21 @@ TEST_F(ConfigfsTest, PathBuildersFollowTheTargetVersion) {
 }
 
 }  // namespace
+
+namespace {
+
+TEST_F(ConfigfsTest, AFailedWriteOfACHAPSecretNeverLogsTheSecret) {
+    // A write that fails: the attribute leads to /dev/full.
+    WriteFile("/config/target/iscsi/t/tpgt_1/acls/i/auth/.keep", "");
+    ASSERT_EQ(0, symlink("/dev/full", Real("/config/target/iscsi/t/tpgt_1/acls/i/auth/password").c_str()));
+    ASSERT_EQ(0, symlink("/dev/full", Real("/config/target/iscsi/t/tpgt_1/acls/i/auth/userid").c_str()));
+    EXPECT_EQ(18990040u, ORLOiSCSIConfigfsWrite("/config/target/iscsi/t/tpgt_1/acls/i/auth/password", "s3cretchap12"));
+    EXPECT_EQ(18990040u, ORLOiSCSIConfigfsPrintf("/config/target/iscsi/t/tpgt_1/acls/i/auth/password", "%s", "s3cretchap12"));
+    EXPECT_FALSE(log_.Contains("s3cretchap12")) << log_.Dump();
+    EXPECT_TRUE(log_.Contains("\"********\"")) << log_.Dump();
+    // Other attributes are shown as they are.
+    EXPECT_EQ(18990040u, ORLOiSCSIConfigfsWrite("/config/target/iscsi/t/tpgt_1/acls/i/auth/userid", "alice"));
+    EXPECT_TRUE(log_.Contains("\"alice\"")) << log_.Dump();
+}
+
+}  // namespace

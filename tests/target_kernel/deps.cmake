@@ -1,0 +1,4 @@
+# The kernel-side access-list tests mount the simulated kernel target built in sim/.
+if(TARGET orlo-configfs-sim)
+  add_dependencies(test_target_kernel orlo-configfs-sim orlo-sim-insmod)
+endif()
