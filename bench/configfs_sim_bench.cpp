@@ -3,6 +3,8 @@
 // calls an administrator's script makes.  Each prints operations per second
 // (items_per_second).  Needs root and /dev/fuse; mounts a private simulator in /tmp.
 #include <benchmark/benchmark.h>
+
+#include "bench_sim.h"
 #include <fcntl.h>
 #include <ftw.h>
 #include <limits.h>
@@ -130,16 +132,6 @@ void BM_Tree256Targets(benchmark::State &state) {
 }
 BENCHMARK(BM_Tree256Targets)->Unit(benchmark::kMillisecond)->UseRealTime();
 
-int RemoveOne(const char *path, const struct stat *, int type, struct FTW *) {
-    if (type == FTW_DP)
-        rmdir(path);
-    else
-        unlink(path);
-    return 0;
-}
-
-bool Control(const char *text) { return Put(M("/.sim/modules"), text); }
-
 }  // namespace
 
 int main(int argc, char **argv) {
@@ -147,43 +139,16 @@ int main(int argc, char **argv) {
         fprintf(stderr, "configfs_sim_bench: needs root and /dev/fuse to mount the simulator; skipped\n");
         return 0;
     }
-    char self[PATH_MAX];
-    ssize_t n = readlink("/proc/self/exe", self, sizeof(self) - 1);
-    if (n <= 0) return 1;
-    self[n] = '\0';
-    std::string sim = std::string(self).substr(0, std::string(self).rfind('/')) + "/orlo-configfs-sim";
-    char tmpl[] = "/tmp/orlo-simbench-XXXXXX";
-    if (mkdtemp(tmpl) == nullptr) return 1;
-    g_root = tmpl;
-    g_mount = g_root + "/config";
-    mkdir(g_mount.c_str(), 0755);
-    mkdir((g_root + "/volume1").c_str(), 0755);
-    int fd = open((g_root + "/volume1/lun.img").c_str(), O_CREAT | O_WRONLY | O_CLOEXEC, 0644);
-    if (fd >= 0) close(fd);
-
-    pid_t pid = fork();
-    if (pid == 0) {
-        prctl(PR_SET_PDEATHSIG, SIGTERM);
-        execl(sim.c_str(), sim.c_str(), "--root", g_root.c_str(), g_mount.c_str(), static_cast<char *>(nullptr));
-        _exit(127);
-    }
-    struct stat st;
-    bool up = false;
-    for (int i = 0; i < 2000 && !up; ++i) {
-        up = stat(M("/.sim/modules").c_str(), &st) == 0;
-        if (!up) std::this_thread::sleep_for(std::chrono::milliseconds(5));
-    }
+    benchsim::Sim sim;
     int rc = 1;
-    if (!up) {
-        fprintf(stderr, "configfs_sim_bench: %s did not mount\n", sim.c_str());
-    } else {
-        bool ok = true;
-        for (const char *m : {"rodsp_ep", "orlo_extent_pool", "target_core_mod", "target_core_iblock",
-                              "target_core_file", "target_core_ep", "iscsi_target_mod"})
-            ok = ok && Control((std::string("insert ") + m + "\n").c_str());
-        ok = ok && mkdir(M("/target/iscsi").c_str(), 0700) == 0 &&
-             mkdir(M("/target/iscsi/iqn.2000-01.com.orlo:bench").c_str(), 0700) == 0 &&
-             mkdir(M("/target/iscsi/iqn.2000-01.com.orlo:bench/tpgt_1").c_str(), 0700) == 0;
+    if (benchsim::Start("configfs_sim_bench", {"/volume1"}, &sim)) {
+        g_root = sim.root;
+        g_mount = sim.mount;
+        int fd = open((g_root + "/volume1/lun.img").c_str(), O_CREAT | O_WRONLY | O_CLOEXEC, 0644);
+        if (fd >= 0) close(fd);
+        bool ok = mkdir(M("/target/iscsi").c_str(), 0700) == 0 &&
+                  mkdir(M("/target/iscsi/iqn.2000-01.com.orlo:bench").c_str(), 0700) == 0 &&
+                  mkdir(M("/target/iscsi/iqn.2000-01.com.orlo:bench/tpgt_1").c_str(), 0700) == 0;
         if (!ok) {
             fprintf(stderr, "configfs_sim_bench: could not prepare the tree\n");
         } else {
@@ -193,9 +158,6 @@ int main(int argc, char **argv) {
             rc = 0;
         }
     }
-    kill(pid, SIGTERM);
-    waitpid(pid, nullptr, 0);
-    umount2(g_mount.c_str(), MNT_DETACH);
-    nftw(g_root.c_str(), RemoveOne, 16, FTW_DEPTH | FTW_PHYS | FTW_MOUNT);
+    benchsim::Stop(&sim);
     return rc;
 }

@@ -5,6 +5,8 @@
 // also with 64 mapped targets in the fabric, whose LUN entries every unload looks
 // through.  Needs root and /dev/fuse; mounts a private simulator under /tmp.
 #include <benchmark/benchmark.h>
+
+#include "bench_sim.h"
 #include <fcntl.h>
 #include <ftw.h>
 #include <limits.h>
@@ -130,16 +132,6 @@ void BM_File1024With64MappedTargets(benchmark::State &state) {
 }
 BENCHMARK(BM_File1024With64MappedTargets)->Unit(benchmark::kMillisecond)->UseManualTime()->Iterations(3);
 
-int RemoveOne(const char *path, const struct stat *, int type, struct FTW *) {
-    if (type == FTW_DP)
-        rmdir(path);
-    else
-        unlink(path);
-    return 0;
-}
-
-bool Control(const char *text) { return Put(M("/.sim/modules"), text); }
-
 bool Prepare() {
     FILE *f = fopen((g_root + "/etc.defaults/orloinfo.conf").c_str(), "w");
     if (f == nullptr) return false;
@@ -159,40 +151,14 @@ int main(int argc, char **argv) {
         fprintf(stderr, "lun_load_bench: needs root and /dev/fuse to mount the simulator; skipped\n");
         return 0;
     }
-    char self[PATH_MAX];
-    ssize_t n = readlink("/proc/self/exe", self, sizeof(self) - 1);
-    if (n <= 0) return 1;
-    self[n] = '\0';
-    std::string sim = std::string(self).substr(0, std::string(self).rfind('/')) + "/orlo-configfs-sim";
-    char tmpl[] = "/tmp/orlo-loadbench-XXXXXX";
-    if (mkdtemp(tmpl) == nullptr) return 1;
-    g_root = tmpl;
-    g_mount = g_root + "/config";
-    for (const char *d : {"/config", "/volume1", "/tmp", "/etc", "/etc.defaults", "/usr", "/usr/orlo", "/usr/orlo/etc"})
-        mkdir((g_root + d).c_str(), 0755);
-    setenv("ORLO_SYSROOT", g_root.c_str(), 1);
-
-    pid_t pid = fork();
-    if (pid == 0) {
-        prctl(PR_SET_PDEATHSIG, SIGTERM);
-        execl(sim.c_str(), sim.c_str(), "--root", g_root.c_str(), g_mount.c_str(), static_cast<char *>(nullptr));
-        _exit(127);
-    }
-    struct stat st;
-    bool up = false;
-    for (int i = 0; i < 2000 && !up; ++i) {
-        up = stat(M("/.sim/modules").c_str(), &st) == 0;
-        if (!up) std::this_thread::sleep_for(std::chrono::milliseconds(5));
-    }
+    benchsim::Sim sim;
     int rc = 1;
-    if (!up) {
-        fprintf(stderr, "lun_load_bench: %s did not mount\n", sim.c_str());
-    } else {
-        bool ok = true;
-        for (const char *m : {"rodsp_ep", "orlo_extent_pool", "target_core_mod", "target_core_iblock",
-                              "target_core_file", "target_core_ep", "iscsi_target_mod"})
-            ok = ok && Control((std::string("insert ") + m + "\n").c_str());
-        if (!ok || !Prepare()) {
+    if (benchsim::Start("lun_load_bench", {"/volume1", "/tmp", "/etc", "/etc.defaults", "/usr", "/usr/orlo", "/usr/orlo/etc"},
+                        &sim)) {
+        g_root = sim.root;
+        g_mount = sim.mount;
+        setenv("ORLO_SYSROOT", g_root.c_str(), 1);
+        if (!Prepare()) {
             fprintf(stderr, "lun_load_bench: could not prepare the sandbox\n");
         } else {
             benchmark::Initialize(&argc, argv);
@@ -201,9 +167,6 @@ int main(int argc, char **argv) {
             rc = 0;
         }
     }
-    kill(pid, SIGTERM);
-    waitpid(pid, nullptr, 0);
-    umount2(g_mount.c_str(), MNT_DETACH);
-    nftw(g_root.c_str(), RemoveOne, 16, FTW_DEPTH | FTW_PHYS | FTW_MOUNT);
+    benchsim::Stop(&sim);
     return rc;
 }
