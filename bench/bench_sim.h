@@ -24,6 +24,8 @@
 #include <string>
 #include <thread>
 
+#include <benchmark/benchmark.h>
+
 namespace benchsim {
 
 struct Sim {
@@ -96,6 +98,40 @@ inline void Stop(Sim *sim) {
     }
     if (!sim->mount.empty()) umount2(sim->mount.c_str(), MNT_DETACH);
     if (!sim->root.empty()) nftw(sim->root.c_str(), RemoveOne, 16, FTW_DEPTH | FTW_PHYS | FTW_MOUNT);
+}
+
+// Writes a whole attribute as a shell's "echo VALUE > PATH" does.
+inline bool Put(const std::string &path, const char *value) {
+    int fd = open(path.c_str(), O_WRONLY | O_TRUNC | O_CLOEXEC);
+    if (fd < 0) return false;
+    size_t len = strlen(value);
+    bool ok = write(fd, value, len) == static_cast<ssize_t>(len);
+    close(fd);
+    return ok;
+}
+
+// The main of a benchmark that needs the simulator: skips without root or /dev/fuse,
+// starts it, lets prepare(sim) fill the sandbox, runs the benchmarks and stops it.
+template <typename Prepare>
+int Main(int argc, char **argv, const char *who, std::initializer_list<const char *> dirs, Prepare prepare) {
+    if (geteuid() != 0 || access("/dev/fuse", R_OK | W_OK) != 0) {
+        fprintf(stderr, "%s: needs root and /dev/fuse to mount the simulator; skipped\n", who);
+        return 0;
+    }
+    Sim sim;
+    int rc = 1;
+    if (Start(who, dirs, &sim)) {
+        if (!prepare(sim)) {
+            fprintf(stderr, "%s: could not prepare the sandbox\n", who);
+        } else {
+            benchmark::Initialize(&argc, argv);
+            benchmark::RunSpecifiedBenchmarks();
+            benchmark::Shutdown();
+            rc = 0;
+        }
+    }
+    Stop(&sim);
+    return rc;
 }
 
 }  // namespace benchsim

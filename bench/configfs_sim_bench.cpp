@@ -29,14 +29,7 @@ std::string g_mount;
 
 std::string M(const std::string &inside) { return g_mount + inside; }
 
-bool Put(const std::string &path, const char *value) {
-    int fd = open(path.c_str(), O_WRONLY | O_TRUNC | O_CLOEXEC);
-    if (fd < 0) return false;
-    size_t len = strlen(value);
-    bool ok = write(fd, value, len) == static_cast<ssize_t>(len);
-    close(fd);
-    return ok;
-}
+using benchsim::Put;
 
 void BM_AttributeOpenWriteClose(benchmark::State &state) {
     const std::string attr = M("/target/iscsi/iqn.2000-01.com.orlo:bench/tpgt_1/param/TargetAlias");
@@ -135,29 +128,13 @@ BENCHMARK(BM_Tree256Targets)->Unit(benchmark::kMillisecond)->UseRealTime();
 }  // namespace
 
 int main(int argc, char **argv) {
-    if (geteuid() != 0 || access("/dev/fuse", R_OK | W_OK) != 0) {
-        fprintf(stderr, "configfs_sim_bench: needs root and /dev/fuse to mount the simulator; skipped\n");
-        return 0;
-    }
-    benchsim::Sim sim;
-    int rc = 1;
-    if (benchsim::Start("configfs_sim_bench", {"/volume1"}, &sim)) {
+    return benchsim::Main(argc, argv, "configfs_sim_bench", {"/volume1"}, [](const benchsim::Sim &sim) {
         g_root = sim.root;
         g_mount = sim.mount;
         int fd = open((g_root + "/volume1/lun.img").c_str(), O_CREAT | O_WRONLY | O_CLOEXEC, 0644);
         if (fd >= 0) close(fd);
-        bool ok = mkdir(M("/target/iscsi").c_str(), 0700) == 0 &&
-                  mkdir(M("/target/iscsi/iqn.2000-01.com.orlo:bench").c_str(), 0700) == 0 &&
-                  mkdir(M("/target/iscsi/iqn.2000-01.com.orlo:bench/tpgt_1").c_str(), 0700) == 0;
-        if (!ok) {
-            fprintf(stderr, "configfs_sim_bench: could not prepare the tree\n");
-        } else {
-            benchmark::Initialize(&argc, argv);
-            benchmark::RunSpecifiedBenchmarks();
-            benchmark::Shutdown();
-            rc = 0;
-        }
-    }
-    benchsim::Stop(&sim);
-    return rc;
+        return mkdir(M("/target/iscsi").c_str(), 0700) == 0 &&
+               mkdir(M("/target/iscsi/iqn.2000-01.com.orlo:bench").c_str(), 0700) == 0 &&
+               mkdir(M("/target/iscsi/iqn.2000-01.com.orlo:bench/tpgt_1").c_str(), 0700) == 0;
+    });
 }

@@ -39,14 +39,7 @@ std::vector<ORLOiSCSILun> g_file, g_adv;
 
 std::string M(const std::string &inside) { return g_mount + inside; }
 
-bool Put(const std::string &path, const char *value) {
-    int fd = open(path.c_str(), O_WRONLY | O_TRUNC | O_CLOEXEC);
-    if (fd < 0) return false;
-    size_t len = strlen(value);
-    bool ok = write(fd, value, len) == static_cast<ssize_t>(len);
-    close(fd);
-    return ok;
-}
+using benchsim::Put;
 
 ORLOiSCSILun Record(int lid, uint32_t type) {
     ORLOiSCSILun lun;
@@ -147,26 +140,12 @@ bool Prepare() {
 }  // namespace
 
 int main(int argc, char **argv) {
-    if (geteuid() != 0 || access("/dev/fuse", R_OK | W_OK) != 0) {
-        fprintf(stderr, "lun_load_bench: needs root and /dev/fuse to mount the simulator; skipped\n");
-        return 0;
-    }
-    benchsim::Sim sim;
-    int rc = 1;
-    if (benchsim::Start("lun_load_bench", {"/volume1", "/tmp", "/etc", "/etc.defaults", "/usr", "/usr/orlo", "/usr/orlo/etc"},
-                        &sim)) {
-        g_root = sim.root;
-        g_mount = sim.mount;
-        setenv("ORLO_SYSROOT", g_root.c_str(), 1);
-        if (!Prepare()) {
-            fprintf(stderr, "lun_load_bench: could not prepare the sandbox\n");
-        } else {
-            benchmark::Initialize(&argc, argv);
-            benchmark::RunSpecifiedBenchmarks();
-            benchmark::Shutdown();
-            rc = 0;
-        }
-    }
-    benchsim::Stop(&sim);
-    return rc;
+    return benchsim::Main(argc, argv, "lun_load_bench",
+                          {"/volume1", "/tmp", "/etc", "/etc.defaults", "/usr", "/usr/orlo", "/usr/orlo/etc"},
+                          [](const benchsim::Sim &sim) {
+                              g_root = sim.root;
+                              g_mount = sim.mount;
+                              setenv("ORLO_SYSROOT", g_root.c_str(), 1);
+                              return Prepare();
+                          });
 }
