@@ -194,6 +194,46 @@ ORLO_EXPORT int OLIBPluginRun(POLIB_PLUGIN handle, int event, const char *json);
 ORLO_EXPORT int OLIBPluginCount(const OLIB_PLUGIN *handle);
 ORLO_EXPORT void OLIBPluginExit(POLIB_PLUGIN handle);
 
+/* ---- Network interfaces: the appliance's interfaces and their addresses, as the
+ * kernel reports them now (getifaddrs).  Loopback interfaces are never listed. ---- */
+#define NUM_MAXIFACES 32            /* most interfaces or addresses one query returns */
+#define OLIB_NET_IFNAME_SIZE 16     /* IFNAMSIZ */
+/* Kinds of interfaces a query takes in besides the ordinary (physical, bond, bridge,
+ * VLAN) ones.  PPP means point-to-point links; this platform keeps the HA data link as
+ * an ordinary interface, so NIC_HA_DATA adds nothing of its own. */
+typedef enum {
+    NIC_PHYSICAL = 0x0,
+    NIC_LOGICAL_PPP = 0x1,
+    NIC_HA_DATA = 0x2
+} ORLONICENUM;
+/* Interface flags. */
+#define OLIB_NET_IF_UP 0x1          /* administratively up */
+#define OLIB_NET_IF_LINK 0x2        /* up with a carrier (running) */
+#define OLIB_NET_IF_STATIC 0x4      /* up with an IPv4 address but no carrier: an address
+                                       kept without a link was configured, not leased */
+typedef struct _tag_OLIB_NET_IFINFO {
+    char szName[OLIB_NET_IFNAME_SIZE];  /* "eth0" */
+    char szIP[16];                      /* first IPv4 address, dotted; "" when none */
+    char szMask[16];                    /* its netmask; "" when none */
+    int flags;                          /* OLIB_NET_IF_* */
+    int ifIndex;                        /* the kernel's interface index */
+} OLIB_NET_IFINFO;
+/* Fills pInfo[0..max) with the interfaces of the kinds asked for, in the kernel's
+ * order: their number (0 or more), or -1 with the error state set (bad arguments
+ * OLIBC_ERR_BAD_PARAM, a failed query OLIBC_ERR_IO).  Interfaces beyond max are left
+ * out. */
+ORLO_EXPORT int OLIBNetGetInterfaceInfo(OLIB_NET_IFINFO *pInfo, int max, ORLONICENUM kinds);
+
+/* One IPv6 address of an interface. */
+typedef struct _tag_ORLO_V6_IP {
+    char szIP[46];      /* INET6_ADDRSTRLEN, without scope */
+    int scopeId;        /* interface index for link-local addresses, else 0 */
+    int prefixLen;      /* 0..128 */
+} ORLO_V6_IP;
+/* Fills pIP[0..max) with the IPv6 addresses of interface ifname: their number (0 or
+ * more, 0 also for an unknown interface), or -1 with the error state set. */
+ORLO_EXPORT int ORLOLnxV6IPGet(const char *ifname, ORLO_V6_IP *pIP, int max);
+
 ORLO_EXTERN_C_END
 
 #endif

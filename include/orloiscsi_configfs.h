@@ -63,6 +63,14 @@ ORLO_EXPORT uint32_t ORLOiSCSIConfigfsVdiskHbaPath(const char *name, char *buf, 
 /* The target-core generation in use: 0 (no iSCSI target), 2 or 4. */
 ORLO_EXPORT unsigned int ORLOiSCSIGetLioVersion(void);
 
+/* Switches the target-core version (2 "lio" or 4 "lio4x"; else 18990004): stops the
+ * service, the vhost fabric and every LUN service, switches the extent pools off,
+ * unloads the module sets 1, 4, 2, 3, makes the version current, writes
+ * iscsi_target_type to /etc.defaults/orloinfo.conf and starts the service again, which
+ * loads advanced LUNs under the new version's extent-pool host.  The same version is
+ * success at once. */
+ORLO_EXPORT uint32_t ORLOiSCSIConfigfsChangeCurrentVersion(unsigned int version);
+
 ORLO_EXTERN_C_END
 
 #endif

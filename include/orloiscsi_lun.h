@@ -292,6 +292,9 @@ ORLO_EXPORT uint32_t ORLOiSCSILunIsLoaded(const ORLOiSCSILun *lun, int *loaded);
  * (18990534 "LUN is mapped"); a LUN not loaded is success. */
 ORLO_EXPORT uint32_t ORLOiSCSILunUnload(const ORLOiSCSILun *lun);
 
+/* Writes the LUN backstore's attrib/<attr> (the backstore must be loaded). */
+ORLO_EXPORT uint32_t ORLOiSCSILunConfigfsAttribSet(const ORLOiSCSILun *lun, const char *attr, const char *value);
+
 /* ---- Deletion ---- */
 
 /* Whether a mapping of the LUN is stored (iSCSI_MAP_T*_L<lid> in the mapping file). */

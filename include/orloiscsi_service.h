@@ -59,8 +59,10 @@ ORLO_EXPORT uint32_t ORLOiSCSIUnloadModules(int module_set);
  * failure; whatever was taken out stays out, and a repeated stop carries on from there.
  * Something already gone, or a fabric whose module is not in, is success. */
 
-/* Stops the LUN-backup daemon (/bin/killall orlolunbkp); its failure is logged as
- * "ORLOLunBackupStop() failed" and returned.  No service lock. */
+/* Stops the LUN-backup daemon (/bin/killall orlolunbkp; failure logged as
+ * "ORLOLunBackupStop() failed"), the trash release (ORLOiSCSILunUnmapTrashStop) and the
+ * iSNS client.  Each failure is logged and the next still stopped; the first is
+ * returned.  No service lock. */
 ORLO_EXPORT uint32_t ORLOiSCSIStopMiscService(void);
 /* The misc stop (failure only logged), then every target node under
  * /config/target/iscsi taken out with ORLOiSCSITargetUnloadByConfigfsPath. */
@@ -76,7 +78,9 @@ ORLO_EXPORT uint32_t ORLOiSCSILoopbackStopAllWithoutLock(void);
 ORLO_EXPORT uint32_t ORLOiSCSILunServiceStartAllWithoutLock(void);
 /* Takes every backstore under the target-core hosts (/config/target/core/<host>/<name>)
  * out of the kernel.  One that a fabric LUN entry still links to is left in and counted
- * as 18990534 "LUN is mapped"; one the kernel refuses (a virtual LUN's hold) likewise. */
+ * as 18990534 "LUN is mapped"; one the kernel refuses (a virtual LUN's hold) likewise.
+ * When every backstore is gone, the extent pools (/config/pool/EP_<n>) are switched off
+ * too, so that the extent-pool module can be removed. */
 ORLO_EXPORT uint32_t ORLOiSCSILunServiceStopAllWithoutLock(void);
 ORLO_EXPORT uint32_t ORLOiSCSILunServiceStopAll(void);
 /* Under the service lock: stop all, loopback, vhost, LUN backstores, then the module sets
@@ -86,6 +90,26 @@ ORLO_EXPORT uint32_t ORLOiSCSITotallyStopAndUnload(void);
 /* *in_use is set when the configuration holds any LUN or any target (backup objects
  * left out): then the service has something to serve.  No service lock. */
 ORLO_EXPORT uint32_t ORLOiSCSIServiceIsInUse(bool *in_use);
+
+/* ---- Starting the service ----
+ * Under the service lock: working directories, the iSCSI module set, the plug-in daemon,
+ * every LUN into its backstore, /config/target/iscsi, iSNS, every target whose stored
+ * enabled flag is set (a failing target is logged and the others still started), the
+ * extent-pool unmap buffer and the trash unmap.  Starting a running service succeeds. */
+ORLO_EXPORT uint32_t ORLOiSCSIStartAll(void);
+ORLO_EXPORT uint32_t ORLOiSCSIStartAllWithoutLock(void);
+/* The iSCSI module set (18990030 "Failed to insmod kernel module") and the plug-in
+ * daemon (/sbin/initctl start is_plugind; only logged). */
+ORLO_EXPORT uint32_t ORLOiSCSIStartBasicWithoutLock(void);
+/* Gives back, in the background, the extents of the map files left in every volume's
+ * "@iSCSI/EP_unmap": one ORLOiSCSILunUnmapALUNInBackground per /volume<n> whose trash
+ * holds something, in a process group of its own recorded in
+ * /tmp/iscsi/iscsi_unmap_trash.pid; the call does not wait.  The stop sends SIGTERM to
+ * every recorded group and waits until its processes have ended (SIGKILL after 5 s;
+ * 18990010 when they outlive that too); map files not yet released stay for the next
+ * run. */
+ORLO_EXPORT uint32_t ORLOiSCSILunUnmapTrashInBackground(void);
+ORLO_EXPORT uint32_t ORLOiSCSILunUnmapTrashStop(void);
 
 ORLO_EXTERN_C_END
 

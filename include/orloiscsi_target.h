@@ -298,6 +298,177 @@ ORLO_EXPORT uint32_t ORLOiSCSILioTargetLunInitiatorRw(const char *iqn, int tpgt,
  * an entry would need it; an empty access list writes nothing. */
 ORLO_EXPORT uint32_t ORLOiSCSILioTargetMaskingsChapAuthAdd(const ORLOiSCSITarget *target, int kind);
 
+/* ---- Mappings in the kernel ----
+ * A mapping is kernel first, file second: adding writes the portal group's lun_<n> (with
+ * its link to the LUN's backstore and one entry per access-list initiator) and then the
+ * section; removing takes the kernel side out and then the section.  A failed kernel add
+ * is undone in the kernel and leaves the file untouched; a failed file write after a
+ * kernel change is not undone.  A target that is not in the kernel only gets the section. */
+
+struct _tag_ORLO_ISCSI_CONF;
+
+/* Maps LUN lid into target tid as LUN number lun; a lun of 256 or more takes the smallest
+ * free number.  18990004 bad tid/lid, 18990534 number taken, 18990555 no free number,
+ * 18990425 / 18990724 / 18990550 when the target or LUN cannot be found. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetMappingAdd(int32_t tid, int32_t lid, int32_t lun);
+/* Maps every lid of lids[0..count) into tid, each with the smallest free number. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetMappingsAdd(int32_t tid, const int32_t *lids, int count);
+/* Takes the mapping out of the kernel (18990729 on failure) and removes its section. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetMappingRemove(int32_t tid, int32_t lid);
+/* Removes the mappings of tid whose lid is in lids[0..count): 0 or -1. */
+ORLO_EXPORT int ORLOiSCSITargetMappingsRemove(int32_t tid, const int32_t *lids, int count);
+/* Takes one mapping out of the kernel only: every initiator's lun_<n> entry, then the
+ * portal group's lun_<n> with its link.  conf, when given, holds the mapping with its
+ * target; NULL queries it. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetMappingUnload(int32_t tid, int32_t lid, const struct _tag_ORLO_ISCSI_CONF *conf);
+/* The kernel side of one mapping: loads the LUN's backstore, makes lun/lun_<n>, sets an
+ * advanced LUN's defer_queue_mode, links the backstore and adds each access-list entry's
+ * LUN entry with its write protection (the default entry only under target-core
+ * version 2).  On failure the entries and lun_<n> made here are removed again. */
+ORLO_EXPORT uint32_t ORLOiSCSILioMappingAdd(const ORLOiSCSITarget *target, const struct _tag_ORLO_ISCSI_LUN *lun,
+                                            int32_t n, const ORLOiSCSIAclList *acls);
+/* *used: whether a stored mapping of tid has number n (0..255). */
+ORLO_EXPORT uint32_t ORLOiSCSITargetIsLunMapped(int32_t tid, int32_t n, bool *used);
+/* *present: whether the mapping's lun_<n> exists in the kernel (18990732 when the test
+ * fails). */
+ORLO_EXPORT uint32_t ORLOiSCSITargetLunIsMapped(const ORLOiSCSIMapping *mapping, bool *present);
+/* The smallest LUN number 0..255 no stored mapping of tid uses, or -1 when all are taken
+ * or the mappings cannot be read. */
+ORLO_EXPORT int ORLOiSCSILunUnusedMappingNumberGet(int32_t tid);
+
+/* ---- Loading targets into the kernel's iSCSI fabric ----
+ * A node is /config/target/iscsi/<iqn> with its one portal group tpgt_1. */
+
+/* Status word bits of ORLOiSCSITargetStatusGet. */
+#define ORLO_ISCSI_TARGET_STATUS_PRESENT 0x1  /* tpgt_1 exists */
+#define ORLO_ISCSI_TARGET_STATUS_ENABLED 0x2  /* tpgt_1/enable reads true */
+
+/* One network portal: an address as written in a portal directory name (IPv6 without
+ * brackets) and its port. */
+typedef struct _tag_ORLO_ISCSI_PORTAL {
+    char addr[64];
+    int32_t port;
+} ORLOiSCSIPortal;
+
+/* Builds the node of a target: directories, default entry, node access lists, command
+ * window, portals, CHAP, digests, segment lengths, session limit and alias; the portal
+ * group is not switched on.  A node already present is success at once.  On failure the
+ * half-built node is unloaded again (not with self_test, which only the self-test sets).
+ * A record with enabled clear is stored with enabled set afterwards. */
+ORLO_EXPORT uint32_t ORLOiSCSILioTargetLoad(ORLOiSCSITarget *target, bool self_test);
+/* Loads the node when absent, adds every stored mapping with its LUN, switches the
+ * portal group on and stores the record. */
+ORLO_EXPORT uint32_t ORLOiSCSILioTargetEnable(ORLOiSCSITarget *target, const ORLOiSCSIAclList *acls);
+/* Switches the portal group off and stores the record. */
+ORLO_EXPORT uint32_t ORLOiSCSILioTargetDisable(ORLOiSCSITarget *target);
+/* Writes 1, resp. 0, to the portal group's enable (Allow only when it is off). */
+ORLO_EXPORT uint32_t ORLOiSCSILioTargetAllow(const ORLOiSCSITarget *target);
+ORLO_EXPORT uint32_t ORLOiSCSILioTargetDisallow(const ORLOiSCSITarget *target);
+/* kind 1: auth/userid and auth/password; kind 2: userid_mutual and password_mutual. */
+ORLO_EXPORT uint32_t ORLOiSCSILioTargetChapAuthAdd(int kind, const char *iqn, int tpgt, const char *user,
+                                                   const char *secret);
+/* Makes the target's portals (see docs/targets.md for which); a failing portal is logged
+ * and the others still made. */
+ORLO_EXPORT uint32_t ORLOiSCSILioTargetNetworkPortalLoad(const ORLOiSCSITarget *target);
+ORLO_EXPORT uint32_t ORLOiSCSILioTargetNetworkPortalAdd(const ORLOiSCSITarget *target, const char *addr, int port);
+ORLO_EXPORT uint32_t ORLOiSCSILioTargetNetworkPortalRemove(const ORLOiSCSITarget *target, const char *addr, int port);
+/* Parses a network_portals value ("a.b.c.d:port,[v6]:port") into out[0..max): the number
+ * of portals; an entry that cannot be parsed is logged and skipped. */
+ORLO_EXPORT int ORLOiSCSITargetNetworkPortalConfParse(const char *portals, ORLOiSCSIPortal *out, int max);
+/* Whether /config/target/iscsi/<iqn>/tpgt_<tpgt> exists. */
+ORLO_EXPORT bool ORLOiSCSILioIsTargetAlive(const char *iqn, int tpgt);
+/* Makes a node access list for every stored entry of the target (the default entry only
+ * under target-core version 2). */
+ORLO_EXPORT uint32_t ORLOiSCSILioTargetAclAdd(const ORLOiSCSITarget *target);
+/* Under the service lock: a trial target load, its outcome in /tmp/iscsi_dummy_result. */
+ORLO_EXPORT uint32_t ORLOiSCSILioTargetDummyTest(void);
+/* Switches the portal group's demo mode for the default entry's authority (0: off; 1:
+ * on, write-protected; 3 or 2: on, writable).  Under target-core version 2 the default
+ * entry is a node access list of its own, so the demo mode is always switched off. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetDefaultAclEnable(const ORLOiSCSITarget *target, int32_t authority);
+/* Stores the default entry and applies it when the node is in the kernel. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetDefaultAclSet(const ORLOiSCSITarget *target, int32_t authority);
+/* Unloads a target by record: portal group off and record stored, then the node. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetUnload(ORLOiSCSITarget *target);
+
+/* ---- Target life cycle ---- */
+
+/* The status word: 0 not in the kernel, 1 present with its portal group off, 3 present
+ * and on.  With target NULL the target is looked up by tid. */
+ORLO_EXPORT int ORLOiSCSITargetStatusGet(int32_t tid, const ORLOiSCSITarget *target);
+ORLO_EXPORT bool ORLOiSCSITargetIsAlive(int32_t tid);
+/* Targets (backup objects aside) whose node is in the kernel. */
+ORLO_EXPORT int ORLOiSCSITargetAliveCountGet(void);
+/* Finds a free tid, stores the record and, when enabled, loads it (18990722). */
+ORLO_EXPORT uint32_t ORLOiSCSITargetCreate(ORLOiSCSITarget *target);
+/* Unloads the stored target of the record's tid, stores the record and enables it when
+ * enabled is set.  An unknown tid is success and changes nothing. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetUpdate(ORLOiSCSITarget *target);
+/* Unloads the target, removes its mappings, then its section and access lists. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetRemove(ORLOiSCSITarget *target);
+/* Enable: access lists loaded, ORLOiSCSILioTargetEnable (18990718).  Disable: unload
+ * (18990723).  Neither changes the stored enabled flag. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetEnable(ORLOiSCSITarget *target);
+ORLO_EXPORT uint32_t ORLOiSCSITargetDisable(ORLOiSCSITarget *target);
+/* ORLOiSCSILioTargetLoad(target, false) with iSNS around it (18990722). */
+ORLO_EXPORT uint32_t ORLOiSCSITargetLoad(ORLOiSCSITarget *target);
+
+/* Entries of the state array of DisableByLid / EnableByLid (indexed by tid). */
+#define ORLO_ISCSI_TARGET_STATE_ENTRIES 257
+#define ORLO_ISCSI_TARGET_STATE_UNTOUCHED 0
+#define ORLO_ISCSI_TARGET_STATE_STOPPED 1
+#define ORLO_ISCSI_TARGET_STATE_STOP_FAILED (-1)
+/* Takes down every running target LUN lid is mapped to, marking state[tid]: 0 or -1. */
+ORLO_EXPORT int ORLOiSCSITargetDisableByLid(int32_t *state, int32_t lid);
+/* Re-enables the targets of lid marked 1 in state. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetEnableByLid(int32_t *state, int32_t lid);
+
+/* Connection status of ORLOiSCSITargetConnectionStatusGet. */
+#define ORLO_ISCSI_TARGET_CONN_NONE 0      /* running, no session */
+#define ORLO_ISCSI_TARGET_CONN_ACTIVE 1    /* running with a session */
+#define ORLO_ISCSI_TARGET_CONN_DOWN 2      /* not running */
+ORLO_EXPORT uint32_t ORLOiSCSITargetConnectionStatusGet(int32_t tid, char *out);
+
+/* One iSCSI connection of a target (allocated zeroed, ORLO_ISCSI_SESSION_STATE_ALLOC
+ * bytes). */
+typedef struct _tag_ORLO_ISCSI_SESSION_STATE {
+    uint8_t flag;
+    char ip[46];            /* initiator address */
+    char cid[128];          /* connection id, decimal */
+    char iqn[256];          /* initiator name */
+    ORLOiSCSIListLink link;
+} ORLOiSCSISessionState;
+#define ORLO_ISCSI_SESSION_STATE_ALLOC (sizeof(ORLOiSCSISessionState) > 444 ? sizeof(ORLOiSCSISessionState) : 444)
+typedef ORLOiSCSIList ORLOiSCSISessionStateList;
+#define ORLO_ISCSI_SESSION_STATE_OF(linkPtr) ORLO_ISCSI_LIST_ENTRY(linkPtr, ORLOiSCSISessionState, link)
+#define ORLO_ISCSI_SESSION_STATE_LIST_FOREACH(listPtr, linkVar, sVar)                          \
+    for ((linkVar) = (listPtr)->head.next;                                                     \
+         (linkVar) != &(listPtr)->head && (((sVar) = ORLO_ISCSI_SESSION_STATE_OF(linkVar)), 1); \
+         (linkVar) = (linkVar)->next)
+/* Appends the target's sessions (from tpgt_1/dynamic_sessions): their number, or -1. */
+ORLO_EXPORT int ORLOiSCSITargetSessionStateListGet(int32_t tid, ORLOiSCSISessionStateList *list);
+ORLO_EXPORT void ORLOiSCSITargetSessionStateListFree(ORLOiSCSISessionStateList *list);
+ORLO_EXPORT void ORLOiSCSIStateListFree(ORLOiSCSISessionStateList *list);
+
 ORLO_EXTERN_C_END
+
+#ifdef __cplusplus
+#include <vector>
+/* ---- Maskings: a target's access list as an ordered vector ----
+ * The Create/Update/Remove forms store the request and bring a running target into line
+ * with the stored list: node access lists, per-LUN entries, write protection and
+ * per-initiator CHAP (18990715 / 18990717 / 18990716 on failure, for every refusal too).
+ * All records of one call carry the same tid.  When the kernel cannot follow, the former
+ * entries are stored and applied again, so a failed call changes nothing.  Removing an
+ * initiator without entry succeeds.  The single-record forms wrap their record. */
+ORLO_EXPORT uint32_t ORLOiSCSITargetMaskingGet(int32_t tid, std::vector<ORLOiSCSIAcl> &out);
+ORLO_EXPORT uint32_t ORLOiSCSITargetAclIsIncluded(int32_t tid, const std::vector<ORLOiSCSIAcl> &records, bool &included);
+ORLO_EXPORT uint32_t ORLOiSCSITargetMaskingsCreate(const std::vector<ORLOiSCSIAcl> &records);
+ORLO_EXPORT uint32_t ORLOiSCSITargetMaskingCreate(const ORLOiSCSIAcl &record);
+ORLO_EXPORT uint32_t ORLOiSCSITargetMaskingsUpdate(const std::vector<ORLOiSCSIAcl> &records);
+ORLO_EXPORT uint32_t ORLOiSCSITargetMaskingUpdate(const ORLOiSCSIAcl &record);
+ORLO_EXPORT uint32_t ORLOiSCSITargetMaskingsRemove(const std::vector<ORLOiSCSIAcl> &records);
+ORLO_EXPORT uint32_t ORLOiSCSITargetMaskingRemove(const ORLOiSCSIAcl &record);
+#endif
 
 #endif

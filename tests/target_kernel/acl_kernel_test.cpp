@@ -95,7 +95,11 @@ TEST_F(AclKernelTest, NodeAclIsMadeOnceAndTheDefaultEntryMakesNone) {
     EXPECT_EQ(0u, ORLOiSCSILioTargetNodeAclAdd(kIqn.c_str(), 1, kHost1.c_str()));
     EXPECT_EQ(0u, ORLOiSCSILioTargetNodeAclAdd(kIqn.c_str(), 1, kHost1.c_str())) << "an existing list is kept";
     EXPECT_EQ(0u, ORLOiSCSILioTargetNodeAclAdd(kIqn.c_str(), 1, kDefault.c_str()));
-    EXPECT_EQ(std::vector<std::string>({"mkdir " + kTpg + "/acls/" + kHost1 + " 0"}), Changes());
+    // A new list gets the appliance's command window (16 without a setting), an existing
+    // one is left alone.
+    EXPECT_EQ(std::vector<std::string>({"mkdir " + kTpg + "/acls/" + kHost1 + " 0",
+                                        "write " + kTpg + "/acls/" + kHost1 + "/cmdsn_depth 16 0"}),
+              Changes());
     EXPECT_TRUE(HasLog(log_, "iscsi_lio_target_node_acl_add.cpp", "ORLOiSCSILioTargetNodeAclAdd",
                        "Default ACL of lio is deprecated."))
         << log_.Dump();
@@ -300,7 +304,9 @@ class AclKernelV2Test : public AclKernelTest {
 TEST_F(AclKernelV2Test, DefaultEntryGetsItsOwnNodeAclAndCredentials) {
     ClearTrace();
     EXPECT_EQ(0u, ORLOiSCSILioTargetNodeAclAdd(kIqn.c_str(), 1, kDefault.c_str()));
-    EXPECT_EQ(std::vector<std::string>({"mkdir " + kTpg + "/acls/" + kDefault + " 0"}), Changes());
+    EXPECT_EQ(std::vector<std::string>({"mkdir " + kTpg + "/acls/" + kDefault + " 0",
+                                        "write " + kTpg + "/acls/" + kDefault + "/cmdsn_depth 16 0"}),
+              Changes());
     EXPECT_FALSE(log_.Contains("Default ACL of lio is deprecated."));
 
     ASSERT_EQ(0u, ORLOiSCSITargetConfAclAdd(1, kDefault.c_str(), 3));
