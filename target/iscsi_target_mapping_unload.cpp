@@ -1,0 +1,90 @@
+// Takes one mapping out of the kernel, working from what configfs holds: every
+// initiator's LUN entry lun_<n> under the portal group's acls, then the group's own
+// lun/lun_<n> with its backstore link.  The mapping file is not touched.  A target that
+// is not in the kernel has nothing to remove, which is success.
+#include <string>
+#include <vector>
+
+#include "base/iscsi_base_internal.h"
+#include "target/iscsi_lio_unload_util.h"
+#include "target/lio_acl_util.h"
+#include "target/target_life_util.h"
+
+namespace {
+
+namespace life = orlo::target::life;
+namespace acl = orlo::target::acl;
+
+// Removes the LUN entry n of every node access list of the target's portal group.
+uint32_t ORLOiSCSILioTargetLunACLInitiatorsRemove(const char *iqn, int tpgt, int n) {
+    char acls[acl::kPathSize];
+    uint32_t ret = acl::FormatPath(acls, "/config/target/iscsi/%s/tpgt_%d/acls", iqn, tpgt);
+    if (ret != ORLO_OK) return ret;
+    std::vector<std::string> initiators;
+    if ((ret = orlo::target::ListConfigfsDir(acls, &initiators)) != ORLO_OK) return ret;
+    for (const std::string &initiator : initiators) {
+        if ((ret = ORLOiSCSILioTargetLunAclInitiatorRemove(iqn, tpgt, initiator.c_str(), n)) != ORLO_OK) return ret;
+    }
+    return ORLO_OK;
+}
+
+// Removes the portal group's LUN entry n: its backstore link, then the entry.
+uint32_t ORLOiSCSILioMappingUnlink(const ORLOiSCSITarget *target, int n) {
+    char lun[acl::kPathSize];
+    uint32_t ret = acl::FormatPath(lun, acl::kTpgLunFmt, target->iqn, ISCSI_TARGET_DEFAULT_TPGT_NUMBER, n);
+    if (ret != ORLO_OK) return ret;
+    return ORLOiSCSITargetPortalGroupLunRemoveEntry(lun);
+}
+
+const ORLOiSCSIMapping *FindMapping(const ORLOiSCSIConf &conf, int32_t tid, int32_t lid) {
+    if (!ORLOiSCSIListIsInit(&conf.mappings)) return nullptr;
+    ORLOiSCSIListLink *link;
+    ORLOiSCSIMapping *m;
+    ORLO_ISCSI_MAPPING_LIST_FOREACH(&conf.mappings, link, m) {
+        if (m->tid == tid && m->lid == lid) return m;
+    }
+    return nullptr;
+}
+
+}  // namespace
+
+extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetMappingUnload(int32_t tid, int32_t lid, const ORLOiSCSIConf *given) {
+    if (!life::TidValid(tid) || !life::LidValid(lid)) {
+        ORLO_LOG_BAD_PARAMS();
+        return ORLO_ERR_BAD_PARAMETER;
+    }
+    life::ConfScope queried;
+    const ORLOiSCSIConf *conf = given;
+    if (conf == nullptr) {
+        uint32_t ret = life::QueryConf(life::kQueryOneMapping, tid, lid, queried.get());
+        if (ret != ORLO_OK) {
+            ORLO_LOG_ERR("ORLOiSCSIConfGet(0x%X, tid:%d lid:%d) failed, err=%s", life::kQueryOneMapping, tid, lid,
+                         ORLOiSCSIErrStr(ret));
+            return ret;
+        }
+        conf = queried.get();
+    }
+    const ORLOiSCSIMapping *mapping = FindMapping(*conf, tid, lid);
+    if (mapping == nullptr) {
+        ORLO_LOG_ERR("Failed to zero mapping_cnt:%d", conf->mappings.count);
+        return life::kErrLoadMappingConfig;
+    }
+    if (mapping->pTrg == nullptr) {
+        ORLO_LOG_ERR("Failed to Get a NULL pTrg");
+        return life::kErrLoadTargetConfig;
+    }
+    const ORLOiSCSITarget *target = mapping->pTrg;
+    uint32_t ret = ORLOiSCSILioTargetLunACLInitiatorsRemove(target->iqn, ISCSI_TARGET_DEFAULT_TPGT_NUMBER, mapping->lun);
+    if (ret != ORLO_OK) {
+        ORLO_LOG_ERR("ORLOiSCSILioTargetLunACLInitiatorsRemove(\"%s\", ISCSI_TARGET_DEFAULT_TPGT_NUMBER, %d) failed, "
+                     "err=%s",
+                     target->iqn, mapping->lun, ORLOiSCSIErrStr(ret));
+        return ret;
+    }
+    if ((ret = ORLOiSCSILioMappingUnlink(target, mapping->lun)) != ORLO_OK) {
+        ORLO_LOG_ERR("ORLOiSCSILioMappingUnlink(%p, %d) failed, err=%s", static_cast<const void *>(target),
+                     mapping->lun, ORLOiSCSIErrStr(ret));
+        return life::kErrRemoveMapping;
+    }
+    return ORLO_OK;
+}
