@@ -6,9 +6,13 @@
 #include <cstring>
 
 #include "base/iscsi_base_internal.h"
-#include "orloiscsi_lun.h"
+#include "orloiscsi_conf.h"
 #include "orloiscsi_service.h"
-#include "orloiscsi_target.h"
+
+namespace {
+// Targets, LUNs and mappings, every one but backup objects.
+constexpr uint32_t kEveryObject = ORLO_ISCSI_LUN_FILTER_ALL;
+}  // namespace
 
 extern "C" ORLO_EXPORT uint32_t ORLOiSCSIServiceIsInUse(bool *in_use) {
     if (in_use == nullptr) {
@@ -16,32 +20,18 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSIServiceIsInUse(bool *in_use) {
         return ORLO_ERR_NULL_POINTER;
     }
     *in_use = false;
-    ORLOiSCSILunList luns;
-    memset(&luns, 0, sizeof(luns));
-    uint32_t ret = ORLOiSCSILunConfGetAll(&luns, 0);
-    if (ret != ORLO_OK) {
-        ORLO_LOG_ERR("ORLOiSCSILunConfGetAll(%p, 0) failed, err=%s", static_cast<void *>(&luns), ORLOiSCSIErrStr(ret));
-        return ret;
-    }
-    const bool anyLun = luns.count > 0;
-    ORLOiSCSILunListFree(&luns);
-    if (anyLun) {
-        *in_use = true;
-        return ORLO_OK;
-    }
-
-    ORLOiSCSITargetFilter filter;
+    ORLOiSCSILunFilter filter;
     memset(&filter, 0, sizeof(filter));
-    filter.flags = ORLO_ISCSI_TARGET_FILTER_ALL;
-    ORLOiSCSITargetList targets;
-    memset(&targets, 0, sizeof(targets));
-    ret = ORLOiSCSITargetConfLoad(&filter, &targets);
+    filter.flags = kEveryObject;
+    ORLOiSCSIConf conf;
+    memset(&conf, 0, sizeof(conf));
+    auto freeConf = orlo::MakeScopeExit([&conf] { ORLOiSCSIConfFree(&conf); });
+    uint32_t ret = ORLOiSCSIConfGet(&filter, &conf);
     if (ret != ORLO_OK) {
-        ORLO_LOG_ERR("ORLOiSCSITargetConfLoad(%p, %p) failed, err=%s", static_cast<void *>(&filter),
-                     static_cast<void *>(&targets), ORLOiSCSIErrStr(ret));
+        ORLO_LOG_ERR("ORLOiSCSIConfGet(%p, %p) failed, err=%s", static_cast<void *>(&filter),
+                     static_cast<void *>(&conf), ORLOiSCSIErrStr(ret));
         return ret;
     }
-    *in_use = targets.count > 0;
-    ORLOiSCSITargetListFree(&targets);
+    *in_use = conf.luns.count > 0 || conf.targets.count > 0;
     return ORLO_OK;
 }
