@@ -13,8 +13,15 @@ namespace cli {
 
 namespace {
 
-const Object *const kObjects[] = {&kLunObject,     &kEpObject,   &kServiceObject,
-                                  &kModulesObject, &kConfObject, &kErrstrObject};
+const Object *const kObjects[] = {&kLunObject,     &kTargetObject, &kMapObject,     &kAclObject,
+                                  &kEpObject,      &kServiceObject, &kModulesObject, &kSelftestObject,
+                                  &kConfObject,    &kErrstrObject};
+
+// Options that would carry a CHAP secret on the command line, where every user of the
+// machine can read it (ps, /proc/<pid>/cmdline, shell history).
+const char *const kSecretOptions[] = {"--secret",          "--password",        "--mutual-secret",
+                                      "--mutual-password", "--chap-secret",     "--chap-password",
+                                      "--mutual-chap-secret", "--mutual-chap-password"};
 
 void PrintMainHelp(FILE *out) {
     fprintf(out,
@@ -32,6 +39,12 @@ void PrintMainHelp(FILE *out) {
 }
 
 void PrintObjectHelp(FILE *out, const Object &obj) {
+    if (obj.actions[0].name[0] == '\0') {  // one unnamed action: the object is the command
+        const Action &a = obj.actions[0];
+        fprintf(out, "usage: orloiscsi [--root DIR] [--json] %s%s%s\n\n%s\n  %s\n", obj.name, a.usage[0] ? " " : "",
+                a.usage, obj.summary, a.summary);
+        return;
+    }
     fprintf(out, "usage: orloiscsi [--root DIR] [--json] %s ACTION [ARGS]\n\n%s\n\nActions:\n", obj.name,
             obj.summary);
     for (const Action *a = obj.actions; a->name != nullptr; ++a)
@@ -47,6 +60,67 @@ const Object *FindObject(const std::string &name) {
 bool IsHelp(const std::string &s) { return s == "--help" || s == "-h" || s == "help"; }
 
 }  // namespace
+
+bool ParseNumber(const std::string &s, long min, long max, long *out) {
+    if (s.empty() || !(s[0] == '-' || (s[0] >= '0' && s[0] <= '9'))) return false;
+    errno = 0;
+    char *end = nullptr;
+    long v = strtol(s.c_str(), &end, 10);
+    if (errno != 0 || *end != '\0' || v < min || v > max) return false;
+    *out = v;
+    return true;
+}
+
+const std::vector<std::string> &ParsedOptions::All(const std::string &name) const {
+    static const std::vector<std::string> kNone;
+    auto it = values.find(name);
+    return it == values.end() ? kNone : it->second;
+}
+
+bool ParseOptionList(const Args &args, const OptionSpec *specs, ParsedOptions *out) {
+    for (size_t i = 0; i < args.size(); ++i) {
+        const std::string &a = args[i];
+        if (a.size() < 3 || a[0] != '-' || a[1] != '-') {
+            out->positional.push_back(a);
+            continue;
+        }
+        size_t eq = a.find('=');
+        std::string name = a.substr(0, eq);
+        for (const char *secret : kSecretOptions)
+            if (name == secret) {
+                fprintf(stderr,
+                        "orloiscsi: %s: CHAP secrets are never taken from the command line, where other users "
+                        "can read them; give --secret-file FILE (or --mutual-secret-file FILE), or answer the "
+                        "prompt\n",
+                        name.c_str());
+                return false;
+            }
+        const OptionSpec *known = nullptr;
+        for (const OptionSpec *s = specs; s->name != nullptr; ++s)
+            if (name == s->name) known = s;
+        if (known == nullptr) {
+            fprintf(stderr, "orloiscsi: unknown option '%s'\n", name.c_str());
+            return false;
+        }
+        if (!known->takesValue) {
+            if (eq != std::string::npos) {
+                fprintf(stderr, "orloiscsi: %s takes no value\n", name.c_str());
+                return false;
+            }
+            out->values[name].push_back(std::string());
+            continue;
+        }
+        if (eq != std::string::npos) {
+            out->values[name].push_back(a.substr(eq + 1));
+        } else if (i + 1 < args.size()) {
+            out->values[name].push_back(args[++i]);
+        } else {
+            fprintf(stderr, "orloiscsi: %s needs a value\n", name.c_str());
+            return false;
+        }
+    }
+    return true;
+}
 
 int Fail(uint32_t code) {
     fprintf(stderr, "error: %" PRIu32 " %s\n", code, ORLOiSCSIErrStr(code));
@@ -139,13 +213,16 @@ int main(int argc, char **argv) {
         return 2;
     }
     ++i;
-    if (i >= argc || IsHelp(argv[i])) {
+    // An object whose only action is unnamed and takes no arguments ("selftest") runs
+    // as it stands.
+    bool bare = obj->actions[0].name[0] == '\0' && obj->actions[0].usage[0] == '\0';
+    if ((i >= argc && !bare) || (i < argc && IsHelp(argv[i]))) {
         PrintObjectHelp(i >= argc ? stderr : stdout, *obj);
         return i >= argc ? 2 : 0;
     }
     // An object whose only action is unnamed ("errstr CODE...") takes its arguments at once.
-    const Action *act = nullptr;
-    for (const Action *a = obj->actions; a->name != nullptr; ++a)
+    const Action *act = bare ? obj->actions : nullptr;
+    for (const Action *a = obj->actions; act == nullptr && a->name != nullptr; ++a)
         if (a->name[0] == '\0' || strcmp(a->name, argv[i]) == 0) {
             act = a;
             break;
