@@ -23,6 +23,7 @@ constexpr int kSectionHashSize = 128;
 uint32_t Offer(const ORLOiSCSILunFilter *filter, const OLIBC_SZHASH *section, ORLOiSCSILunList *list,
                bool *accepted) {
     *accepted = false;
+    orlo::olibc::SectionStatsAdd(1, 0);
     uint32_t ret = ORLOiSCSILunFilterApply(filter, section);
     if (ret == orlo::lun::kErrNotAccepted) return ORLO_OK;
     if (ret != ORLO_OK) {

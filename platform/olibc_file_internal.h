@@ -23,6 +23,7 @@
 #ifndef ORLO_PLATFORM_OLIBC_FILE_INTERNAL_H
 #define ORLO_PLATFORM_OLIBC_FILE_INTERNAL_H
 
+#include <stdint.h>
 #include <sys/stat.h>
 
 #include <new>
@@ -129,6 +130,16 @@ std::string ApplyEdits(std::string_view data, const std::vector<Edit> &edits);
 int CodeOfErrno(int err, int fallback);
 
 // Common argument check: a non-empty path.
+// Counts kept by the section readers, for benchmarks that report how much configuration
+// a run parsed: sections whose keys were read, and section names listed.  Relaxed
+// atomics: a reader pays one uncontended increment.
+struct SectionStats {
+    uint64_t parsed;
+    uint64_t listed;
+};
+SectionStats SectionStatsGet();
+void SectionStatsAdd(uint64_t parsed, uint64_t listed);
+
 inline bool IsValidPath(const char *path) { return path != nullptr && path[0] != '\0'; }
 
 // Runs body; an exhausted heap becomes OLIBC_ERR_OUT_OF_MEM and failValue.

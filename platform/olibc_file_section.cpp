@@ -10,6 +10,7 @@
 //   - appending puts the section at the end (after a newline if the last line lacks one).
 // A malformed header ("[]" or "[" alone) makes every section operation refuse the file
 // with OLIBC_ERR_BAD_FORMAT and leave it as it is.
+#include <atomic>
 #include <cstring>
 #include <string_view>
 #include <unordered_set>
@@ -72,6 +73,24 @@ int BadParam() {
 
 }  // namespace
 
+namespace orlo {
+namespace olibc {
+namespace {
+std::atomic<uint64_t> g_parsed{0};
+std::atomic<uint64_t> g_listed{0};
+}  // namespace
+
+SectionStats SectionStatsGet() {
+    return SectionStats{g_parsed.load(std::memory_order_relaxed), g_listed.load(std::memory_order_relaxed)};
+}
+
+void SectionStatsAdd(uint64_t parsed, uint64_t listed) {
+    if (parsed != 0) g_parsed.fetch_add(parsed, std::memory_order_relaxed);
+    if (listed != 0) g_listed.fetch_add(listed, std::memory_order_relaxed);
+}
+}  // namespace olibc
+}  // namespace orlo
+
 extern "C" {
 
 ORLO_EXPORT int OLIBCFileEnumSection(const char *path, POLIBC_SZLIST *ppList) {
@@ -104,6 +123,7 @@ ORLO_EXPORT int OLIBCFileEnumSection(const char *path, POLIBC_SZLIST *ppList) {
                 return -1;
             }
         }
+        orlo::olibc::SectionStatsAdd(0, names.size());
         return static_cast<int>(names.size());
     });
 }
@@ -118,6 +138,7 @@ ORLO_EXPORT int OLIBCFileGetSection(const char *path, const char *section, POLIB
         size_t i = 0;
         while (i < headers.size() && headers[i].name != section) ++i;
         if (i == headers.size()) return 0;
+        orlo::olibc::SectionStatsAdd(1, 0);
         std::vector<std::pair<std::string_view, std::string_view>> pairs;
         LineScanner body(image.data, headers[i].end, orlo::olibc::BodyEnd(headers, i, image.data.size()));
         Line line;
