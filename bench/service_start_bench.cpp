@@ -188,76 +188,54 @@ void Report(benchmark::State &state, double sec, const Ops &ops, uint64_t parsed
     state.counters["sections_parsed"] = static_cast<double>(parsed) / n;
 }
 
-void BM_StartAll(benchmark::State &state) {
-    const int targets = static_cast<int>(state.range(0));
+// One measured run a loop pass: prepare() (untimed) brings the service into the state the
+// measured call starts from, measured() is timed; then the trace is counted.
+template <typename Prepare, typename Measured>
+double Measure(benchmark::State &state, bool building, Prepare prepare, Measured measured) {
     using Clock = std::chrono::steady_clock;
-    if (!UseConfs(targets)) {
+    if (!UseConfs(static_cast<int>(state.range(0)))) {
         state.SkipWithError("could not put the configuration in place");
-        return;
+        return 0;
     }
     double sec = 0;
     uint64_t parsed = 0;
     Ops ops;
     for (auto _ : state) {
         state.PauseTiming();
-        if (ORLOiSCSIStopAll() != 0 || ORLOiSCSILunServiceStopAll() != 0 || !SimWrite("trace", "clear\n")) {
-            state.SkipWithError("could not stop the service");
-            return;
+        if (!prepare() || !SimWrite("trace", "clear\n")) {
+            state.SkipWithError("could not prepare the run");
+            return 0;
         }
         state.ResumeTiming();
         uint64_t p0 = Parsed();
         auto t0 = Clock::now();
-        uint32_t ret = ORLOiSCSIStartAll();
+        uint32_t ret = measured();
         double s = std::chrono::duration<double>(Clock::now() - t0).count();
         parsed += Parsed() - p0;
         state.SetIterationTime(s);
         sec += s;
         if (ret != 0) {
-            state.SkipWithError("start failed");
-            return;
+            state.SkipWithError("the measured call failed");
+            return 0;
         }
         state.PauseTiming();
-        ops = CountOps(true);
+        ops = CountOps(building);
         state.ResumeTiming();
     }
     Report(state, sec, ops, parsed);
-    g_startSec[targets] = sec / static_cast<double>(state.iterations());
+    return sec / static_cast<double>(state.iterations());
+}
+
+void BM_StartAll(benchmark::State &state) {
+    double sec = Measure(
+        state, true, [] { return ORLOiSCSIStopAll() == 0 && ORLOiSCSILunServiceStopAll() == 0; },
+        [] { return ORLOiSCSIStartAll(); });
+    if (sec > 0) g_startSec[static_cast<int>(state.range(0))] = sec;
 }
 BENCHMARK(BM_StartAll)->Arg(kFullTargets / 2)->Arg(kFullTargets)->Unit(benchmark::kMillisecond)->UseManualTime()->Iterations(2);
 
 void BM_StopAll(benchmark::State &state) {
-    const int targets = static_cast<int>(state.range(0));
-    using Clock = std::chrono::steady_clock;
-    if (!UseConfs(targets)) {
-        state.SkipWithError("could not put the configuration in place");
-        return;
-    }
-    double sec = 0;
-    uint64_t parsed = 0;
-    Ops ops;
-    for (auto _ : state) {
-        state.PauseTiming();
-        if (ORLOiSCSIStartAll() != 0 || !SimWrite("trace", "clear\n")) {
-            state.SkipWithError("could not start the service");
-            return;
-        }
-        state.ResumeTiming();
-        uint64_t p0 = Parsed();
-        auto t0 = Clock::now();
-        uint32_t ret = ORLOiSCSIStopAll();
-        double s = std::chrono::duration<double>(Clock::now() - t0).count();
-        parsed += Parsed() - p0;
-        state.SetIterationTime(s);
-        sec += s;
-        if (ret != 0) {
-            state.SkipWithError("stop failed");
-            return;
-        }
-        state.PauseTiming();
-        ops = CountOps(false);
-        state.ResumeTiming();
-    }
-    Report(state, sec, ops, parsed);
+    Measure(state, false, [] { return ORLOiSCSIStartAll() == 0; }, [] { return ORLOiSCSIStopAll(); });
 }
 BENCHMARK(BM_StopAll)->Arg(kFullTargets / 2)->Arg(kFullTargets)->Unit(benchmark::kMillisecond)->UseManualTime()->Iterations(2);
 

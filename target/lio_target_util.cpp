@@ -14,19 +14,6 @@ namespace orlo {
 namespace target {
 namespace lio {
 
-uint32_t FormatPath(char *buf, const char *fmt, ...) {
-    va_list ap;
-    va_start(ap, fmt);
-    int n = vsnprintf(buf, kPathSize, fmt, ap);
-    va_end(ap);
-    if (n < 0 || static_cast<size_t>(n) >= kPathSize) {
-        ORLO_LOG_ERR("snprintf(%p, %zu, \"%s\") failed", static_cast<void *>(buf), kPathSize, fmt);
-        buf[0] = '\0';
-        return ORLO_ERR_PARSE_STRING;
-    }
-    return ORLO_OK;
-}
-
 uint32_t CheckIqn(const char *iqn) {
     if (iqn == nullptr) {
         ORLO_LOG_BAD_PARAMS();

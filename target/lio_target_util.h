@@ -9,13 +9,14 @@
 #include <stdint.h>
 
 #include "orloiscsi_target.h"
+#include "target/lio_acl_util.h"
 
 namespace orlo {
 namespace target {
 namespace lio {
 
 // Size of the configfs path buffers.
-constexpr size_t kPathSize = 320;
+using orlo::target::acl::kPathSize;
 
 constexpr const char kNodeFmt[] = "/config/target/iscsi/%s";
 constexpr const char kTpgFmt[] = "/config/target/iscsi/%s/tpgt_%d";
@@ -41,8 +42,8 @@ constexpr uint32_t kErrGetNetIf = 18990319;           // Failed to get network i
 constexpr uint32_t kErrEnumPortals = 18990734;        // Failed to enumerate target network portals
 
 // Formats a path into buf (kPathSize bytes); a path that does not fit is logged and
-// refused with 18990050, never cut.
-uint32_t FormatPath(char *buf, const char *fmt, ...) __attribute__((format(printf, 2, 3)));
+// refused with 18990050, never cut.  The access-list code's formatter serves both.
+using orlo::target::acl::FormatPath;
 
 // An IQN used as one directory name of the fabric: NULL gives 18990003; empty, "." or
 // "..", or holding "/" gives 18990004.  Logs "Bad parameters" once.

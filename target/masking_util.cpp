@@ -152,18 +152,10 @@ bool CheckRequest(const std::vector<ORLOiSCSIAcl> &records, bool checkAuthority,
 }
 
 uint32_t LoadStored(int32_t tid, StoredMap *stored) {
-    ORLOiSCSIAclList list;
-    ORLOiSCSIListInit(&list);
-    auto freeList = MakeScopeExit([&list] { ORLOiSCSITargetAclListFree(&list); });
-    uint32_t ret = ORLOiSCSITargetConfAclLoad(tid, &list);
-    if (ret != ORLO_OK) {
-        ORLO_LOG_ERR("ORLOiSCSITargetConfAclLoad(%d, %p) failed, err=%s", tid, static_cast<void *>(&list),
-                     ORLOiSCSIErrStr(ret));
-        return ret;
-    }
-    ORLOiSCSIListLink *link;
-    ORLOiSCSIAcl *entry;
-    ORLO_ISCSI_ACL_LIST_FOREACH(&list, link, entry) (*stored)[entry->initiator] = entry->authority;
+    std::vector<ORLOiSCSIAcl> entries;
+    uint32_t ret = ORLOiSCSITargetMaskingGet(tid, entries);
+    if (ret != ORLO_OK) return ret;
+    for (const ORLOiSCSIAcl &e : entries) (*stored)[e.initiator] = e.authority;
     return ORLO_OK;
 }
 

@@ -586,15 +586,6 @@ int RunCreate(const Context &ctx, const Args &args) {
                     t.name);
         return Fail(ret);
     }
-    // Creating loads the node; the portal group only takes logins once enabled, with
-    // the stored mappings and access list in place.
-    if (t.enabled) {
-        ret = ORLOiSCSITargetEnable(&t);
-        if (ret != ORLO_OK) {
-            fprintf(stderr, "orloiscsi: target %d '%s' is stored but could not be enabled\n", t.tid, t.name);
-            return Fail(ret);
-        }
-    }
     int status = ORLOiSCSITargetStatusGet(t.tid, &t);
     if (ctx.json) {
         PrintTargetJson(t, status);
