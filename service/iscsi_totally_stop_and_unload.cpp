@@ -13,32 +13,10 @@
 #include "ep_internal.h"
 #include "orloiscsi_service.h"
 #include "platform/os_seam.h"
+#include "service/kernel_modules.h"
 #include "service/lio_version.h"
 
 namespace {
-
-struct ModuleStep {
-    int set;
-    const char *name;
-    const std::vector<std::string> orlo::LioState::*modules;
-};
-const ModuleStep kUnloadOrder[] = {
-    {ISCSI_KERNEL_MODULES, "ISCSI_KERNEL_MODULES", &orlo::LioState::iscsiModules},
-    {LOOPBACK_KERNEL_MODULES, "LOOPBACK_KERNEL_MODULES", &orlo::LioState::loopbackModules},
-    {VHOST_KERNEL_MODULES, "VHOST_KERNEL_MODULES", &orlo::LioState::vhostModules},
-    {TCM_KERNEL_MODULES, "TCM_KERNEL_MODULES", &orlo::LioState::tcmModules},
-};
-
-// A set none of whose modules is in the kernel (never loaded, or taken out by an
-// earlier stop) has nothing to remove; removing it would only report the kernel's
-// "not loaded" for its first module.  When the module table cannot be read the set is
-// removed all the same.
-bool SetHasModuleIn(const ModuleStep &step) {
-    std::shared_ptr<const orlo::LioState> lio = orlo::Lio();
-    for (const std::string &name : (*lio).*step.modules)
-        if (orlo::os::ModuleLoaded(name.c_str()) != 0) return true;
-    return false;
-}
 
 void KeepFirst(uint32_t *first, uint32_t ret) {
     if (*first == ORLO_OK) *first = ret;
@@ -63,8 +41,8 @@ uint32_t TotallyStopAndUnloadWithoutLock() {
         ORLO_LOG_ERR("ORLOiSCSILunServiceStopAllWithoutLock() failed, err=%s", ORLOiSCSIErrStr(ret));
         KeepFirst(&first, ret);
     }
-    for (const ModuleStep &step : kUnloadOrder) {
-        if (!SetHasModuleIn(step)) continue;
+    for (const orlo::service::ModuleUnloadStep &step : orlo::service::kModuleUnloadOrder) {
+        if (!orlo::service::ModuleSetHasModuleIn(step.set)) continue;
         if ((ret = ORLOiSCSIUnloadModulesWithoutLock(step.set)) != ORLO_OK) {
             ORLO_LOG_ERR("ORLOiSCSIUnloadModulesWithoutLock(%s) failed, err=%s", step.name, ORLOiSCSIErrStr(ret));
             KeepFirst(&first, ret);

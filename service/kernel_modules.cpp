@@ -10,6 +10,7 @@
 #include "base/iscsi_base_internal.h"
 #include "orloiscsi_service.h"
 #include "platform/os_seam.h"
+#include "service/lio_version.h"
 
 namespace orlo {
 namespace service {
@@ -83,6 +84,28 @@ uint32_t rmmod_module_set(const std::vector<std::string> &modules) {
         }
     }
     return ORLO_OK;
+}
+
+const ModuleUnloadStep kModuleUnloadOrder[4] = {
+    {ISCSI_KERNEL_MODULES, "ISCSI_KERNEL_MODULES"},
+    {LOOPBACK_KERNEL_MODULES, "LOOPBACK_KERNEL_MODULES"},
+    {VHOST_KERNEL_MODULES, "VHOST_KERNEL_MODULES"},
+    {TCM_KERNEL_MODULES, "TCM_KERNEL_MODULES"},
+};
+
+bool ModuleSetHasModuleIn(int moduleSet) {
+    std::shared_ptr<const LioState> lio = Lio();
+    const std::vector<std::string> *modules = nullptr;
+    switch (moduleSet) {
+        case ISCSI_KERNEL_MODULES: modules = &lio->iscsiModules; break;
+        case VHOST_KERNEL_MODULES: modules = &lio->vhostModules; break;
+        case TCM_KERNEL_MODULES: modules = &lio->tcmModules; break;
+        case LOOPBACK_KERNEL_MODULES: modules = &lio->loopbackModules; break;
+        default: return false;
+    }
+    for (const std::string &name : *modules)
+        if (os::ModuleLoaded(name.c_str()) != 0) return true;
+    return false;
 }
 
 }  // namespace service

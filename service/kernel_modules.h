@@ -29,6 +29,20 @@ uint32_t rmmod_module_set(const std::vector<std::string> &modules);
 // True for the set numbers 1..4; logs "invalid kernel module set" otherwise.
 bool ModuleSetIsValid(int moduleSet);
 
+// The module sets in the order a stop takes them out: fabrics before the core (1, 4, 2,
+// 3), each with the name its log lines use.
+struct ModuleUnloadStep {
+    int set;
+    const char *name;
+};
+extern const ModuleUnloadStep kModuleUnloadOrder[4];
+
+// Whether any module of the set is in the kernel.  A set with none in (never loaded, as
+// vhost and loopback often are, or taken out by an earlier stop) has nothing to remove;
+// removing it would only report "not loaded" for its first module.  When the module
+// table cannot be read the answer is yes, so the set is removed all the same.
+bool ModuleSetHasModuleIn(int moduleSet);
+
 }  // namespace service
 }  // namespace orlo
 
