@@ -4,6 +4,7 @@
 #define ORLO_BASE_CONF_SNAPSHOT_INTERNAL_H
 
 #include <cstdint>
+#include <vector>
 
 #include "orloiscsi_conf.h"
 #include "orloiscsi_list.h"
@@ -24,6 +25,19 @@ constexpr uint32_t kErrGetConfig = 18990425;       // Failed to get iSCSIConfig
 constexpr uint32_t kErrLoadLunConfig = 18990550;   // Failed to load LUN config
 constexpr uint32_t kErrLoadTargetConfig = 18990724; // Failed to load target config
 constexpr uint32_t kErrLoadMappingConfig = 18990731; // Failed to load mapping config
+
+// The lids named by the mapping sections that the filter's mapping criteria accept,
+// sorted and without repeats, read without waiting for the mapping file's lock and
+// without a word in the log or the platform error.  false when they cannot be told (the
+// file busy, unreadable or malformed, a section without a lid): the caller then reads
+// every LUN.  (target/iscsi_target_conf_mapping_load.cpp)
+bool MappedLids(const ORLOiSCSILunFilter *filter, std::vector<int32_t> *lids);
+
+// ORLOiSCSILunConfLoad for a snapshot that keeps only mapped LUNs: the LUNs of the global
+// file that the filter accepts, where those whose lid is not in lids (sorted) may be left
+// out; they are read all the same whenever leaving them out could change the result or
+// the log (lun/iscsi_lun_conf_load_by_path.cpp).
+uint32_t LunConfLoadOfLids(const ORLOiSCSILunFilter *filter, ORLOiSCSILunList *list, const std::vector<int32_t> &lids);
 
 // Moves every element of src to the tail of dst (initialising dst when zero-filled) and
 // leaves src empty.  Nothing is allocated or freed.

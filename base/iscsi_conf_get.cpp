@@ -1,7 +1,12 @@
 // Loads a configuration snapshot: targets, LUNs and mappings as the filter's kind bits
 // ask, in that order, each file under its own lock and released before the next is
 // read; then links the mappings and keeps only mapped objects when asked.  A snapshot is
-// returned whole or not at all.
+// returned whole or not at all.  A snapshot of mapped objects only reads just the LUNs
+// that the mapping file names (a quick look at it first), with the same result.
+#include <algorithm>
+#include <new>
+#include <vector>
+
 #include "base/conf_snapshot_internal.h"
 #include "base/iscsi_base_internal.h"
 
@@ -21,6 +26,16 @@ ORLOiSCSITargetFilter TargetFilterOf(const ORLOiSCSILunFilter *filter) {
     return t;
 }
 
+// Whether every mapping of the list names one of lids (sorted).
+bool NamesOnly(ORLOiSCSIMappingList &mappings, const std::vector<int32_t> &lids) {
+    ORLOiSCSIListLink *link;
+    ORLOiSCSIMapping *m;
+    ORLO_ISCSI_MAPPING_LIST_FOREACH(&mappings, link, m) {
+        if (!std::binary_search(lids.begin(), lids.end(), m->lid)) return false;
+    }
+    return true;
+}
+
 uint32_t Load(const ORLOiSCSILunFilter *filter, ORLOiSCSIConf *conf) {
     const uint32_t flags = filter->flags;
     if (flags & ORLO_ISCSI_LUN_FILTER_LOAD_TARGETS) {
@@ -32,8 +47,22 @@ uint32_t Load(const ORLOiSCSILunFilter *filter, ORLOiSCSIConf *conf) {
             return kErrLoadTargetConfig;
         }
     }
+    // A snapshot that keeps only mapped objects needs only the LUNs its mappings name:
+    // their lids are looked up first, and the LUN reader may leave the others unread.
+    const bool mappedOnly = (flags & ORLO_ISCSI_LUN_FILTER_LOAD_LUNS) && (flags & ORLO_ISCSI_LUN_FILTER_LOAD_MAPPINGS) &&
+                            (flags & ORLO_ISCSI_LUN_FILTER_MAPPED_ONLY);
+    std::vector<int32_t> mappedLids;
+    bool narrowed = false;
+    if (mappedOnly) {
+        try {
+            narrowed = MappedLids(filter, &mappedLids);
+        } catch (const std::bad_alloc &) {
+            narrowed = false;
+        }
+    }
     if (flags & ORLO_ISCSI_LUN_FILTER_LOAD_LUNS) {
-        uint32_t ret = ORLOiSCSILunConfLoad(filter, &conf->luns);
+        uint32_t ret = narrowed ? LunConfLoadOfLids(filter, &conf->luns, mappedLids)
+                                : ORLOiSCSILunConfLoad(filter, &conf->luns);
         if (ret != ORLO_OK) {
             ORLO_LOG_ERR("ORLOiSCSILunConfLoad(%p, %p) failed, err=%s", static_cast<const void *>(filter),
                          static_cast<void *>(&conf->luns), ORLOiSCSIErrStr(ret));
@@ -46,6 +75,17 @@ uint32_t Load(const ORLOiSCSILunFilter *filter, ORLOiSCSIConf *conf) {
             ORLO_LOG_ERR("ORLOiSCSITargetConfMappingLoad(%p, %p) failed, err=%s", static_cast<const void *>(filter),
                          static_cast<void *>(conf), ORLOiSCSIErrStr(ret));
             return kErrLoadMappingConfig;
+        }
+    }
+    if (narrowed && !NamesOnly(conf->mappings, mappedLids)) {
+        // The mapping file changed between the two reads and names a LUN left unread:
+        // read the LUNs again, all of them, as a snapshot without the shortcut would.
+        ORLOiSCSILunListFree(&conf->luns);
+        uint32_t ret = ORLOiSCSILunConfLoad(filter, &conf->luns);
+        if (ret != ORLO_OK) {
+            ORLO_LOG_ERR("ORLOiSCSILunConfLoad(%p, %p) failed, err=%s", static_cast<const void *>(filter),
+                         static_cast<void *>(&conf->luns), ORLOiSCSIErrStr(ret));
+            return kErrLoadLunConfig;
         }
     }
     if (ORLOiSCSITargetConfMappingMake(conf) != 0) {

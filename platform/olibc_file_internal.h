@@ -125,14 +125,17 @@ struct Edit {
 void AddEdit(std::vector<Edit> *edits, size_t begin, size_t end, std::string text = std::string());
 // The image with every edit applied (edits in ascending, non-overlapping order).
 std::string ApplyEdits(std::string_view data, const std::vector<Edit> &edits);
+// Whether ApplyEdits(data, edits) would be data again, found without building it: the
+// section writers leave a file alone rather than write the same bytes.
+bool ChangesNothing(std::string_view data, const std::vector<Edit> &edits);
 
 // Maps an errno to the platform code that describes it best, else fallback.
 int CodeOfErrno(int err, int fallback);
 
-// Common argument check: a non-empty path.
 // Counts kept by the section readers, for benchmarks that report how much configuration
-// a run parsed: sections whose keys were read, and section names listed.  Relaxed
-// atomics: a reader pays one uncontended increment.
+// a run parsed: sections parsed (every section of a file each time the file is parsed,
+// whether into a kept parse or by the line-by-line LUN reader), and section names listed.
+// Relaxed atomics: a reader pays one uncontended increment.
 struct SectionStats {
     uint64_t parsed;
     uint64_t listed;
@@ -140,6 +143,7 @@ struct SectionStats {
 SectionStats SectionStatsGet();
 void SectionStatsAdd(uint64_t parsed, uint64_t listed);
 
+// Common argument check: a non-empty path.
 inline bool IsValidPath(const char *path) { return path != nullptr && path[0] != '\0'; }
 
 // Runs body; an exhausted heap becomes OLIBC_ERR_OUT_OF_MEM and failValue.

@@ -13,8 +13,8 @@
 #include <atomic>
 #include <cstring>
 #include <string_view>
-#include <unordered_set>
 
+#include "platform/olibc_file_cache.h"
 #include "platform/olibc_file_internal.h"
 
 namespace {
@@ -26,6 +26,7 @@ using orlo::olibc::Header;
 using orlo::olibc::Line;
 using orlo::olibc::LineKind;
 using orlo::olibc::LineScanner;
+using orlo::olibc::SectionFile;
 
 // Every pair must be writable as one key line.
 bool ArePairsValid(const OLIBC_SZHASH *hash) {
@@ -71,10 +72,46 @@ int BadParam() {
     return -1;
 }
 
+// Writes the edited image over path, unless it would be the same bytes: an unchanged file
+// keeps its inode and times, costs no temporary file and no sync, and keeps the parses
+// that readers hold.  0, or -1 with the platform error set.
+int WriteEdited(const char *path, const FileImage &image, const struct stat *st, const std::vector<Edit> &edits) {
+    if (orlo::olibc::ChangesNothing(image.data, edits)) return 0;
+    if (orlo::olibc::ReplaceFile(path, st, orlo::olibc::ApplyEdits(image.data, edits)) != 0) return -1;
+    orlo::olibc::SectionFileForget(path);
+    return 0;
+}
+
 }  // namespace
 
 namespace orlo {
 namespace olibc {
+
+// Whether applying edits to data gives data again.  Only the edited stretches are
+// compared: the text between edits is the image itself, at an offset shifted by what the
+// edits before it added or removed.
+bool ChangesNothing(std::string_view data, const std::vector<Edit> &edits) {
+    size_t size = data.size();
+    for (const Edit &e : edits) size = size - (e.end - e.begin) + e.text.size();
+    if (size != data.size()) return false;
+    size_t in = 0;   // next byte of data not yet placed
+    size_t out = 0;  // where it lands in the result
+    auto same = [&](const char *piece, size_t n) {
+        bool ok = memcmp(piece, data.data() + out, n) == 0;
+        out += n;
+        return ok;
+    };
+    for (const Edit &e : edits) {
+        if (in == out)
+            out += e.begin - in;  // the image against itself
+        else if (!same(data.data() + in, e.begin - in))
+            return false;
+        if (!same(e.text.data(), e.text.size())) return false;
+        in = e.end;
+    }
+    return true;  // the sizes agree, so the tail is the image against itself
+}
+
 namespace {
 std::atomic<uint64_t> g_parsed{0};
 std::atomic<uint64_t> g_listed{0};
@@ -96,24 +133,21 @@ extern "C" {
 ORLO_EXPORT int OLIBCFileEnumSection(const char *path, POLIBC_SZLIST *ppList) {
     if (!orlo::olibc::IsValidPath(path) || ppList == nullptr) return BadParam();
     return orlo::olibc::Guarded(-1, [&]() -> int {
-        FileImage image;
-        std::vector<Header> headers;
-        if (orlo::olibc::ReadImage(path, &image, false) != 0 || ReadHeaders(image.data, &headers) != 0) return -1;
-        std::vector<std::string_view> names;
-        std::unordered_set<std::string_view> seen;
-        for (const Header &h : headers)
-            if (seen.insert(h.name).second) names.push_back(h.name);
+        std::shared_ptr<const SectionFile> file = orlo::olibc::SectionFileLoad(path);
+        if (file == nullptr) return -1;
+        if (file->HasBadHeader()) return BadFormat();
+        int count = 0;
+        for (size_t i = 0; i < file->Count(); ++i) count += file->IsFirstOfName(i) ? 1 : 0;
         bool ours = *ppList == nullptr;
         if (ours) {
-            *ppList = OLIBCSzListAlloc(static_cast<int>(names.size()));
+            *ppList = OLIBCSzListAlloc(count);
             if (*ppList == nullptr) return -1;
         } else {
             OLIBCSzListRemoveAll(*ppList);
         }
-        std::string name;
-        for (std::string_view n : names) {
-            name.assign(n);
-            if (OLIBCSzListPush(ppList, name.c_str()) < 0) {
+        for (size_t i = 0; i < file->Count(); ++i) {
+            if (!file->IsFirstOfName(i)) continue;
+            if (OLIBCSzListPush(ppList, file->Name(i)) < 0) {
                 if (ours) {
                     OLIBCSzListFree(*ppList);
                     *ppList = nullptr;
@@ -123,8 +157,8 @@ ORLO_EXPORT int OLIBCFileEnumSection(const char *path, POLIBC_SZLIST *ppList) {
                 return -1;
             }
         }
-        orlo::olibc::SectionStatsAdd(0, names.size());
-        return static_cast<int>(names.size());
+        orlo::olibc::SectionStatsAdd(0, static_cast<uint64_t>(count));
+        return count;
     });
 }
 
@@ -132,43 +166,12 @@ ORLO_EXPORT int OLIBCFileGetSection(const char *path, const char *section, POLIB
     if (!orlo::olibc::IsValidPath(path) || !orlo::olibc::IsValidSectionName(section) || ppHash == nullptr)
         return BadParam();
     return orlo::olibc::Guarded(-1, [&]() -> int {
-        FileImage image;
-        std::vector<Header> headers;
-        if (orlo::olibc::ReadImage(path, &image, false) != 0 || ReadHeaders(image.data, &headers) != 0) return -1;
-        size_t i = 0;
-        while (i < headers.size() && headers[i].name != section) ++i;
-        if (i == headers.size()) return 0;
-        orlo::olibc::SectionStatsAdd(1, 0);
-        std::vector<std::pair<std::string_view, std::string_view>> pairs;
-        LineScanner body(image.data, headers[i].end, orlo::olibc::BodyEnd(headers, i, image.data.size()));
-        Line line;
-        while (body.Next(&line)) {
-            body.Parse(&line);
-            if (line.kind == LineKind::kKey) pairs.emplace_back(line.key, line.value);
-        }
-        bool ours = *ppHash == nullptr;
-        if (ours) {
-            *ppHash = OLIBCSzHashAlloc(static_cast<int>(pairs.size()));
-            if (*ppHash == nullptr) return -1;
-        } else {
-            OLIBCSzHashRemoveAll(*ppHash);
-        }
-        std::string key;
-        std::string value;
-        for (const auto &kv : pairs) {
-            key.assign(kv.first);
-            value.assign(kv.second);
-            if (OLIBCSzHashSetValue(ppHash, key.c_str(), value.c_str()) != 0) {
-                if (ours) {
-                    OLIBCSzHashFree(*ppHash);
-                    *ppHash = nullptr;
-                } else {
-                    OLIBCSzHashRemoveAll(*ppHash);
-                }
-                return -1;
-            }
-        }
-        return 1;
+        std::shared_ptr<const SectionFile> file = orlo::olibc::SectionFileLoad(path);
+        if (file == nullptr) return -1;
+        if (file->HasBadHeader()) return BadFormat();
+        long i = file->Find(section);
+        if (i < 0) return 0;
+        return file->CopyInto(static_cast<size_t>(i), ppHash) != 0 ? -1 : 1;
     });
 }
 
@@ -204,7 +207,7 @@ ORLO_EXPORT int OLIBCFileSetSection(const char *path, const char *oldName, const
             }
         }
         if (!found) return 0;
-        if (orlo::olibc::ReplaceFile(path, &image.st, orlo::olibc::ApplyEdits(image.data, edits)) != 0) return -1;
+        if (WriteEdited(path, image, &image.st, edits) != 0) return -1;
         return 1;
     });
 }
@@ -226,7 +229,7 @@ ORLO_EXPORT int OLIBCFileAddSection(const char *path, const char *section, const
         }
         std::vector<Edit> edits;
         AddEdit(&edits, image.data.size(), image.data.size(), AtEnd(image.data, SectionText(section, pHash, lineFmt)));
-        if (orlo::olibc::ReplaceFile(path, &image.st, orlo::olibc::ApplyEdits(image.data, edits)) != 0) return -1;
+        if (WriteEdited(path, image, &image.st, edits) != 0) return -1;
         return 1;
     });
 }
@@ -251,7 +254,7 @@ ORLO_EXPORT int OLIBCFileRemoveSection(const char *path, const char *section) {
             }
         }
         if (!found) return 0;
-        if (orlo::olibc::ReplaceFile(path, &image.st, orlo::olibc::ApplyEdits(image.data, edits)) != 0) return -1;
+        if (WriteEdited(path, image, &image.st, edits) != 0) return -1;
         return 1;
     });
 }
@@ -296,8 +299,7 @@ ORLO_EXPORT int OLIBCFileSetSectionValue(const char *path, const char *section, 
                 AddEdit(&edits, insertAt, insertAt, std::move(keyLine));
             }
         }
-        std::string content = orlo::olibc::ApplyEdits(image.data, edits);
-        return orlo::olibc::ReplaceFile(path, exists ? &image.st : nullptr, content) != 0 ? -1 : 0;
+        return WriteEdited(path, image, exists ? &image.st : nullptr, edits);
     });
 }
 

@@ -1,8 +1,10 @@
 // The upsert of one target section behind ORLOiSCSITargetConfAdd and
 // ORLOiSCSITargetConfUpdate.  The two differ on purpose in what they accept and how they
 // report: Add inserts or replaces, Update insists that an existing file already holds
-// the section.  Secrets are enciphered; an empty secret is stored empty.
+// the section.  Secrets are enciphered; an empty secret is stored empty, an unchanged one
+// keeps the form it is stored in.
 #include <cstdio>
+#include <cstring>
 
 #include "base/iscsi_base_internal.h"
 #include "target/target_internal.h"
@@ -29,11 +31,34 @@ AuthWords AuthOf(int32_t type, bool update) {
     return {"no", "no"};
 }
 
-// Enciphers a secret into out (64 bytes); an empty one stays empty.
-int Encipher(const char *plain, char *out, size_t size) {
+// Enciphers a secret into out (64 bytes); an empty one stays empty.  A secret that the
+// section already holds keeps its stored form (stored, or nullptr): the cipher draws a
+// fresh nonce each time, and enciphering an unchanged secret again would rewrite the file
+// (and make every reader parse it again) on each update, as every service start does.
+int Encipher(const char *plain, const char *stored, char *out, size_t size) {
     out[0] = '\0';
     if (plain[0] == '\0') return 0;
+    if (stored != nullptr && stored[0] != '\0' && strlen(stored) < size) {
+        const int code = OLIBCErrGet();
+        const char *file = OLIBCErrorGetFile();
+        const int line = OLIBCErrorGetLine();
+        char clear[ORLO_ISCSI_TARGET_CHAP_SIZE];
+        const bool same = OLIBCCryptSzDecrypt(stored, clear, sizeof(clear)) == 0 && strcmp(clear, plain) == 0;
+        explicit_bzero(clear, sizeof(clear));
+        if (same) {
+            strcpy(out, stored);
+            return 0;
+        }
+        OLIBCErrSetEx(code, file, line);  // a stale or foreign stored form is no failure
+    }
     return OLIBCCryptSzEncrypt(plain, out, size);
+}
+
+// Copies a stored value of the section (or "" when absent or too long to reuse).
+void KeepStored(const OLIBC_SZHASH *section, const char *key, char *out, size_t size) {
+    const char *v = OLIBCSzHashGetValue(section, key);
+    out[0] = '\0';
+    if (v != nullptr && strlen(v) < size) strcpy(out, v);
 }
 
 }  // namespace
@@ -63,6 +88,8 @@ uint32_t WriteTargetSection(const ORLOiSCSITarget *t, bool update) {
 
     const bool fileExists = OLIBCFileExist(kConfPath) == 1;
     bool present = false;
+    char storedPassword[ORLO_ISCSI_TARGET_CHAP_SIZE] = "";
+    char storedMutualPassword[ORLO_ISCSI_TARGET_CHAP_SIZE] = "";
     if (fileExists) {
         int got = OLIBCFileGetSection(kConfPath, section, hash.addr());
         if (got < 0) {
@@ -80,6 +107,10 @@ uint32_t WriteTargetSection(const ORLOiSCSITarget *t, bool update) {
             return ORLO_ERR_DEFAULT;
         }
         present = got > 0;
+        if (present) {
+            KeepStored(hash.get(), "password", storedPassword, sizeof(storedPassword));
+            KeepStored(hash.get(), "mutual_password", storedMutualPassword, sizeof(storedMutualPassword));
+        }
         OLIBCSzHashRemoveAll(hash.get());
     }
 
@@ -95,12 +126,12 @@ uint32_t WriteTargetSection(const ORLOiSCSITarget *t, bool update) {
 
     char password[ORLO_ISCSI_TARGET_CHAP_SIZE];
     char mutualPassword[ORLO_ISCSI_TARGET_CHAP_SIZE];
-    if (Encipher(t->password, password, sizeof(password)) != 0) {
+    if (Encipher(t->password, storedPassword, password, sizeof(password)) != 0) {
         ORLO_LOG_ERR("Failed to encrypt password[0x%04X %s:%d]", OLIBCErrGet(), OLIBCErrorGetFile(),
                      OLIBCErrorGetLine());
         return update ? kErrBadPassword : static_cast<uint32_t>(ORLO_ERR_DEFAULT);
     }
-    if (Encipher(t->mutual_password, mutualPassword, sizeof(mutualPassword)) != 0) {
+    if (Encipher(t->mutual_password, storedMutualPassword, mutualPassword, sizeof(mutualPassword)) != 0) {
         ORLO_LOG_ERR("Failed to encrypt mutual password[0x%04X %s:%d]", OLIBCErrGet(), OLIBCErrorGetFile(),
                      OLIBCErrorGetLine());
         return update ? kErrBadMutualPassword : static_cast<uint32_t>(ORLO_ERR_DEFAULT);

@@ -1,0 +1,330 @@
+// The per-thread cache of parsed section files: parsing one image, the lazily built
+// hashes, indexes and facts of a parse, and the small least-recently-used table that
+// ties each parse to the version of the file it came from.
+#include "platform/olibc_file_cache.h"
+
+#include <sys/stat.h>
+#include <time.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <climits>
+#include <cstring>
+#include <new>
+#include <stdexcept>
+
+#include "platform/olibc_file_internal.h"
+#include "platform/os_seam.h"
+
+namespace orlo {
+namespace olibc {
+
+namespace {
+
+// Files changed this close before they were read are compared by content at each use:
+// timestamps advance in ticks (a jiffy of the coarse clock, up to a second on some file
+// systems), and an edit within the tick of the one we read would keep every stat field.
+constexpr time_t kRacySeconds = 2;
+thread_local time_t tlsRacySeconds = kRacySeconds;
+
+const std::vector<uint32_t> kNoCandidates;
+
+}  // namespace
+
+SectionFile::~SectionFile() {
+    for (POLIBC_SZHASH h : hashes_) OLIBCSzHashFree(h);
+}
+
+void SectionFile::Parse(std::string data) {
+    data_ = std::move(data);
+    strings_.clear();
+    sections_.clear();
+    pairs_.clear();
+    firstByName_.clear();
+    hasBadHeader_ = false;
+    hasNulInName_ = false;
+    if (data_.size() > UINT32_MAX / 2) throw std::bad_alloc();  // offsets are 32-bit
+    strings_.reserve(data_.size() + 1);
+    strings_.push_back('\0');  // offset 0: the empty name of a malformed header
+    auto store = [this](std::string_view s) {
+        uint32_t off = static_cast<uint32_t>(strings_.size());
+        strings_.append(s);
+        strings_.push_back('\0');
+        return off;
+    };
+    LineScanner scanner(data_);
+    Line line;
+    while (scanner.Next(&line)) {
+        if (line.kind == LineKind::kHeader || line.kind == LineKind::kBadHeader) {
+            Section s{};
+            s.badHeader = line.kind == LineKind::kBadHeader;
+            s.nameOff = s.badHeader ? 0 : store(line.name);
+            s.nameLen = static_cast<uint32_t>(line.name.size());
+            s.pairBegin = s.pairEnd = static_cast<uint32_t>(pairs_.size());
+            hasBadHeader_ = hasBadHeader_ || s.badHeader;
+            hasNulInName_ = hasNulInName_ || line.name.find('\0') != std::string_view::npos;
+            sections_.push_back(s);
+            continue;
+        }
+        if (sections_.empty()) continue;  // before the first header: no section's line
+        scanner.Parse(&line);
+        if (line.kind != LineKind::kKey) continue;
+        Pair p{};
+        p.keyOff = store(line.key);
+        p.valueOff = store(line.value);
+        pairs_.push_back(p);
+        sections_.back().pairEnd = static_cast<uint32_t>(pairs_.size());
+    }
+    // strings_ no longer grows: views into it stay valid.
+    firstByName_.reserve(sections_.size());
+    for (size_t i = 0; i < sections_.size(); ++i) {
+        Section &s = sections_[i];
+        if (s.badHeader) continue;
+        s.firstOfName = firstByName_.emplace(std::string_view(Name(i), s.nameLen), static_cast<uint32_t>(i)).second;
+    }
+    hashes_.assign(sections_.size(), nullptr);
+}
+
+long SectionFile::Find(std::string_view name) const {
+    auto it = firstByName_.find(name);
+    return it == firstByName_.end() ? -1 : static_cast<long>(it->second);
+}
+
+const char *SectionFile::ValueOf(size_t i, const char *key) const {
+    for (size_t k = PairCount(i); k-- > 0;)
+        if (strcmp(Key(i, k), key) == 0) return Value(i, k);
+    return nullptr;
+}
+
+int SectionFile::CopyInto(size_t i, POLIBC_SZHASH *ppHash) const {
+    const bool ours = *ppHash == nullptr;
+    if (ours) {
+        *ppHash = OLIBCSzHashAlloc(static_cast<int>(PairCount(i)));
+        if (*ppHash == nullptr) return -1;
+    } else {
+        OLIBCSzHashRemoveAll(*ppHash);
+    }
+    for (size_t k = 0; k < PairCount(i); ++k) {
+        if (OLIBCSzHashSetValue(ppHash, Key(i, k), Value(i, k)) != 0) {
+            if (ours) {
+                OLIBCSzHashFree(*ppHash);
+                *ppHash = nullptr;
+            } else {
+                OLIBCSzHashRemoveAll(*ppHash);
+            }
+            return -1;
+        }
+    }
+    return 0;
+}
+
+const OLIBC_SZHASH *SectionFile::Hash(size_t i) const {
+    if (hashes_[i] == nullptr) {
+        POLIBC_SZHASH h = nullptr;
+        if (CopyInto(i, &h) != 0) return nullptr;
+        hashes_[i] = h;
+    }
+    return hashes_[i];
+}
+
+const std::vector<uint32_t> *SectionFile::Candidates(KeyOf keyOf, int64_t key) const {
+    try {
+        const Index *index = nullptr;
+        for (const auto &entry : indexes_)
+            if (entry.first == keyOf) index = entry.second.get();
+        if (index == nullptr) {
+            auto built = std::make_unique<Index>();
+            for (size_t i = 0; i < sections_.size(); ++i) {
+                int64_t k = 0;
+                if (keyOf(*this, i, &k)) (*built)[k].push_back(static_cast<uint32_t>(i));
+            }
+            index = built.get();
+            indexes_.emplace_back(keyOf, std::move(built));
+        }
+        auto it = index->find(key);
+        return it == index->end() ? &kNoCandidates : &it->second;
+    } catch (const std::bad_alloc &) {
+        OLIBCErrSet(OLIBC_ERR_OUT_OF_MEM);
+        return nullptr;
+    }
+}
+
+bool SectionFile::Holds(Fact fact) const {
+    for (const auto &entry : facts_)
+        if (entry.first == fact) return entry.second;
+    bool holds = fact(*this);
+    try {
+        facts_.emplace_back(fact, holds);
+    } catch (const std::bad_alloc &) {
+        OLIBCErrSet(OLIBC_ERR_OUT_OF_MEM);
+        return false;
+    }
+    return holds;
+}
+
+bool CandidatesOf(const SectionFile &file, SectionFile::KeyOf keyOf, const std::vector<int64_t> &keys,
+                  std::vector<uint32_t> *out) {
+    try {
+        out->clear();
+        for (int64_t key : keys) {
+            const std::vector<uint32_t> *c = file.Candidates(keyOf, key);
+            if (c == nullptr) return false;
+            out->insert(out->end(), c->begin(), c->end());
+        }
+        std::sort(out->begin(), out->end());
+        out->erase(std::unique(out->begin(), out->end()), out->end());
+        return true;
+    } catch (const std::bad_alloc &) {
+        OLIBCErrSet(OLIBC_ERR_OUT_OF_MEM);
+        return false;
+    }
+}
+
+namespace {
+
+struct Identity {
+    dev_t dev = 0;
+    ino_t ino = 0;
+    off_t size = 0;
+    struct timespec mtime {};
+    struct timespec ctime {};
+};
+
+// How finely timestamps tell versions apart: exact here, coarser in tests that play a
+// file system whose timestamps advance in ticks.
+thread_local int64_t tlsTickNs = 1;
+
+bool operator==(const struct timespec &a, const struct timespec &b) {
+    const int64_t na = static_cast<int64_t>(a.tv_sec) * 1000000000 + a.tv_nsec;
+    const int64_t nb = static_cast<int64_t>(b.tv_sec) * 1000000000 + b.tv_nsec;
+    return na / tlsTickNs == nb / tlsTickNs;
+}
+
+bool operator==(const Identity &a, const Identity &b) {
+    return a.dev == b.dev && a.ino == b.ino && a.size == b.size && a.mtime == b.mtime && a.ctime == b.ctime;
+}
+
+Identity IdentityOf(const struct stat &st) {
+    Identity id;
+    id.dev = st.st_dev;
+    id.ino = st.st_ino;
+    id.size = st.st_size;
+    id.mtime = st.st_mtim;
+    id.ctime = st.st_ctim;
+    return id;
+}
+
+struct timespec Now() {
+    struct timespec now {};
+    clock_gettime(CLOCK_REALTIME, &now);
+    return now;
+}
+
+// Whether a file changed at ctime may still change without its stat telling, as seen by
+// a read that started at readStart.
+bool IsRacy(const struct timespec &ctime, const struct timespec &readStart) {
+    time_t limit = readStart.tv_sec - tlsRacySeconds;
+    return ctime.tv_sec > limit || (ctime.tv_sec == limit && ctime.tv_nsec >= readStart.tv_nsec);
+}
+
+struct Entry {
+    std::string mapped;  // the path as the seam maps it: a new sandbox root is a new file
+    Identity id;
+    bool racy = false;
+    std::shared_ptr<const SectionFile> file;
+};
+
+// Most recently used first.
+thread_local std::vector<Entry> tlsEntries;
+
+std::shared_ptr<const SectionFile> ParseImage(FileImage *image) {
+    auto file = std::make_shared<SectionFile>();
+    file->Parse(std::move(image->data));
+    SectionStatsAdd(file->Count(), 0);
+    return file;
+}
+
+std::shared_ptr<const SectionFile> Load(const char *path) {
+    std::string mapped = os::Map(path);
+    if (mapped.empty()) {  // cannot be mapped: let the read report why
+        FileImage image;
+        if (ReadImage(path, &image, false) != 0) return nullptr;
+        return ParseImage(&image);
+    }
+    auto it = std::find_if(tlsEntries.begin(), tlsEntries.end(),
+                           [&mapped](const Entry &e) { return e.mapped == mapped; });
+    struct stat st;
+    if (it != tlsEntries.end()) {
+        if (os::Stat(path, &st) == 0 && IdentityOf(st) == it->id && !it->racy) {
+            std::rotate(tlsEntries.begin(), it, it + 1);
+            return tlsEntries.front().file;
+        }
+    }
+    const struct timespec readStart = Now();
+    FileImage image;
+    if (ReadImage(path, &image, false) != 0) {
+        if (it != tlsEntries.end()) tlsEntries.erase(it);
+        return nullptr;
+    }
+    const Identity id = IdentityOf(image.st);
+    const bool racy = IsRacy(id.ctime, readStart);
+    if (it != tlsEntries.end() && it->file->Data() == image.data) {
+        // The same bytes (a racy file unchanged, or a file rewritten as it was): the kept
+        // parse still holds, and is trusted by stat alone once the file is old enough.
+        it->id = id;
+        it->racy = racy;
+        std::rotate(tlsEntries.begin(), it, it + 1);
+        return tlsEntries.front().file;
+    }
+    std::shared_ptr<const SectionFile> file = ParseImage(&image);
+    if (it != tlsEntries.end()) tlsEntries.erase(it);
+    if (tlsEntries.size() >= kSectionFileCacheSize) tlsEntries.pop_back();
+    Entry entry;
+    entry.mapped = std::move(mapped);
+    entry.id = id;
+    entry.racy = racy;
+    entry.file = file;
+    tlsEntries.insert(tlsEntries.begin(), std::move(entry));
+    return file;
+}
+
+}  // namespace
+
+std::shared_ptr<const SectionFile> SectionFileLoad(const char *path) {
+    if (!IsValidPath(path)) {
+        OLIBCErrSet(OLIBC_ERR_BAD_PARAM);
+        return nullptr;
+    }
+    try {
+        return Load(path);
+    } catch (const std::bad_alloc &) {
+        OLIBCErrSet(OLIBC_ERR_OUT_OF_MEM);
+        return nullptr;
+    } catch (const std::length_error &) {
+        OLIBCErrSet(OLIBC_ERR_OUT_OF_MEM);
+        return nullptr;
+    }
+}
+
+void SectionFileForget(const char *path) {
+    if (!IsValidPath(path)) return;
+    try {
+        std::string mapped = os::Map(path);
+        tlsEntries.erase(std::remove_if(tlsEntries.begin(), tlsEntries.end(),
+                                        [&mapped](const Entry &e) { return e.mapped == mapped; }),
+                         tlsEntries.end());
+    } catch (const std::bad_alloc &) {
+        tlsEntries.clear();  // cannot tell which: forget them all
+    }
+}
+
+void SectionFileCacheClear() { tlsEntries.clear(); }
+
+size_t SectionFileCacheEntries() { return tlsEntries.size(); }
+
+void SectionFileCacheSetTimestampTick(int64_t ns) { tlsTickNs = ns > 0 ? ns : 1; }
+
+void SectionFileCacheSetRacySeconds(int seconds) { tlsRacySeconds = seconds >= 0 ? seconds : kRacySeconds; }
+
+}  // namespace olibc
+}  // namespace orlo
