@@ -11,6 +11,7 @@
 #include <unistd.h>
 
 #include <utility>
+#include <vector>
 
 #include "base/orlo_log.h"
 #include "olibc.h"
@@ -149,6 +150,10 @@ class FileLockGuard {
     const char *path_;
     int handle_ = -1;
 };
+
+// The numbers of the data volumes "/volumeN" at the root, ascending, into *out.  0, or
+// 18990026 when the root cannot be listed (logged).
+uint32_t VolumeNumbers(std::vector<int> *out);
 
 }  // namespace orlo
 

@@ -17,18 +17,6 @@
 
 namespace {
 
-// "volume<n>" with n decimal from 1, without a leading zero; -1 for any other name.
-int VolumeOfName(const char *name) {
-    if (strncmp(name, "volume", 6) != 0 || name[6] < '1' || name[6] > '9') return -1;
-    long long n = 0;
-    for (const char *p = name + 6; *p != '\0'; ++p) {
-        if (*p < '0' || *p > '9') return -1;
-        n = n * 10 + (*p - '0');
-        if (n > INT_MAX) return -1;
-    }
-    return static_cast<int>(n);
-}
-
 // Hands the buffer to a pool that is on but was brought up without it.
 uint32_t UnmapOn(int n, const char *buf) {
     char enableAttr[320], pathAttr[320];
@@ -52,18 +40,7 @@ uint32_t UnmapOn(int n, const char *buf) {
 
 extern "C" ORLO_EXPORT uint32_t ORLOiSCSIEpUnmapBufferCheckAndEnable(void) {
     std::vector<int> volumes;
-    {
-        orlo::DirGuard dir(orlo::os::Opendir("/"));
-        if (dir.get() == nullptr) {
-            ORLO_LOG_ERR("opendir(\"%s\") failed, err=%m", "/");
-            return ORLO_ERR_OPEN_DIR;
-        }
-        while (struct dirent *e = readdir(dir.get())) {
-            int n = VolumeOfName(e->d_name);
-            if (n > 0) volumes.push_back(n);
-        }
-    }
-    std::sort(volumes.begin(), volumes.end());
+    if (orlo::VolumeNumbers(&volumes) != ORLO_OK) return ORLO_ERR_OPEN_DIR;
     uint32_t first = ORLO_OK;
     for (int n : volumes) {
         char volume[EP_PATH_SIZE], buf[EP_PATH_SIZE];

@@ -51,6 +51,9 @@ ORLO_EXPORT int ORLOFSSetNodatacow(const char *path);
 ORLO_EXPORT int ORLOFSFallocate(int fd, int mode, off_t offset, off_t len);
 /* The number N of the "/volumeN" a path lies on, or -1 when it lies on none. */
 ORLO_EXPORT int ORLOVolumeNumGet(const char *path);
+/* The numbers of the volumes "/volumeN" at the root, ascending, into out[0..max): the
+ * number of volumes there are (more than max when out was too short), or -1. */
+ORLO_EXPORT int ORLOVolumeNumsList(int *out, int max);
 /* Copies a regular file with its mode, replacing dst atomically.  0 or -1. */
 ORLO_EXPORT int ORLOFileCopy(const char *src, const char *dst);
 

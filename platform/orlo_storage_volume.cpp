@@ -1,7 +1,14 @@
-// Volume numbers: the N of the "/volumeN" mount point a path lies on.
+// Volume numbers: the N of the "/volumeN" mount point a path lies on, and the volumes the
+// root holds.
+#include <dirent.h>
+
+#include <algorithm>
 #include <climits>
 #include <cerrno>
 #include <cstring>
+#include <memory>
+#include <string>
+#include <vector>
 
 #include "olibc.h"
 #include "orlo_storage.h"
@@ -47,6 +54,31 @@ ORLO_EXPORT int ORLOVolumeNumGet(const char *path) {
         return -1;
     }
     return num;
+}
+
+ORLO_EXPORT int ORLOVolumeNumsList(int *out, int max) {
+    if (max < 0 || (out == nullptr && max > 0)) {
+        ORLO_STORAGE_FAIL(EINVAL, OLIBC_ERR_BAD_PARAM);
+        return -1;
+    }
+    std::vector<int> nums;
+    {
+        std::unique_ptr<DIR, int (*)(DIR *)> root(orlo::os::Opendir("/"), closedir);
+        if (root == nullptr) {
+            ORLO_STORAGE_FAIL(errno, OLIBC_ERR_FOPEN);
+            return -1;
+        }
+        std::string path;
+        while (struct dirent *e = readdir(root.get())) {
+            path.assign("/").append(e->d_name);
+            if (strchr(e->d_name, '/') != nullptr) continue;
+            int n = ParseVolumeNum(path.c_str());
+            if (n > 0) nums.push_back(n);
+        }
+    }
+    std::sort(nums.begin(), nums.end());
+    for (size_t i = 0; i < nums.size() && i < static_cast<size_t>(max); ++i) out[i] = nums[i];
+    return static_cast<int>(nums.size());
 }
 
 }  // extern "C"

@@ -31,18 +31,6 @@ namespace unmap = orlo::service::unmap;
 
 constexpr uint32_t kErrFork = 18990014;
 
-// "volume<n>" with n decimal from 1, without a leading zero; -1 for any other name.
-int VolumeOfName(const char *name) {
-    if (strncmp(name, "volume", 6) != 0 || name[6] < '1' || name[6] > '9') return -1;
-    long long n = 0;
-    for (const char *p = name + 6; *p != '\0'; ++p) {
-        if (*p < '0' || *p > '9') return -1;
-        n = n * 10 + (*p - '0');
-        if (n > INT_MAX) return -1;
-    }
-    return static_cast<int>(n);
-}
-
 // Whether the volume's trash holds any entry; a missing trash holds none.
 bool TrashHoldsSomething(const char *volume) {
     char dir[EP_PATH_SIZE];
@@ -61,18 +49,7 @@ bool TrashHoldsSomething(const char *volume) {
 
 uint32_t VolumesWithTrash(std::vector<std::string> *volumes) {
     std::vector<int> numbers;
-    {
-        orlo::DirGuard root(orlo::os::Opendir("/"));
-        if (root.get() == nullptr) {
-            ORLO_LOG_ERR("opendir(\"%s\") failed, err=%m", "/");
-            return ORLO_ERR_OPEN_DIR;
-        }
-        while (struct dirent *e = readdir(root.get())) {
-            int n = VolumeOfName(e->d_name);
-            if (n > 0) numbers.push_back(n);
-        }
-    }
-    std::sort(numbers.begin(), numbers.end());
+    if (orlo::VolumeNumbers(&numbers) != ORLO_OK) return ORLO_ERR_OPEN_DIR;
     for (int n : numbers) {
         std::string volume = "/volume" + std::to_string(n);
         if (TrashHoldsSomething(volume.c_str())) volumes->push_back(volume);

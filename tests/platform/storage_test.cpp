@@ -11,6 +11,7 @@
 #include <cerrno>
 #include <cstring>
 #include <string>
+#include <vector>
 
 #include "olibc.h"
 #include "orlo_storage.h"
@@ -53,6 +54,21 @@ TEST_F(StorageTest, VolumeNumbersComeFromTheVolumeMountPoint) {
     ASSERT_EQ(0, symlink(Real("/volume2/dir").c_str(), Real("/tmp/link").c_str()));
     EXPECT_EQ(2, ORLOVolumeNumGet("/tmp/link"));
     EXPECT_EQ(2, ORLOVolumeNumGet("/volume1/../volume2/dir"));
+
+    // The volumes at the root, ascending by number (not by name), only well-formed names;
+    // a short array still learns how many there are.
+    for (const char *d : {"/volume10", "/volume3", "/volume01", "/volumeUSB1", "/volume0"})
+        mkdir(Real(d).c_str(), 0755);
+    std::vector<int> want;
+    for (int n : {1, 2, 3, 10})
+        if (access(Real("/volume" + std::to_string(n)).c_str(), F_OK) == 0) want.push_back(n);
+    int nums[16] = {0};
+    ASSERT_EQ(static_cast<int>(want.size()), ORLOVolumeNumsList(nums, 16));
+    EXPECT_EQ(want, std::vector<int>(nums, nums + want.size()));
+    int first = 0;
+    EXPECT_EQ(static_cast<int>(want.size()), ORLOVolumeNumsList(&first, 1));
+    EXPECT_EQ(want[0], first);
+    EXPECT_EQ(-1, ORLOVolumeNumsList(nullptr, 2));
 }
 
 TEST_F(StorageTest, FileSystemTypesOfMountedVolumes) {
