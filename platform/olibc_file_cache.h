@@ -152,6 +152,33 @@ struct ErrState {
 // OLIBC_ERR_TOO_LONG, OLIBC_ERR_OUT_OF_MEM.  A failure is never kept.
 std::shared_ptr<const SectionFile> SectionFileLoad(const char *path);
 
+// The parse of path for a reader that falls back to reading by name when the parse
+// cannot serve it: nullptr when the file cannot be parsed or is not plain (a malformed
+// header, a NUL in a name), with the platform error state left as it was before, so
+// that the fallback reports what it finds as it always has.
+inline std::shared_ptr<const SectionFile> PlainSectionFileLoad(const char *path) {
+    const ErrState before = ErrState::Save();
+    std::shared_ptr<const SectionFile> file = SectionFileLoad(path);
+    if (file != nullptr && file->IsPlain()) return file;
+    before.Restore();
+    return nullptr;
+}
+
+// Calls visit(i) for each of candidates (every section when candidates is nullptr) that
+// readers by name see, the first section of each name, in file order; the first result
+// other than 0 ends the walk and is returned.
+template <typename Visit>
+uint32_t ForEachNamedSection(const SectionFile &file, const std::vector<uint32_t> *candidates, Visit visit) {
+    const size_t n = candidates != nullptr ? candidates->size() : file.Count();
+    for (size_t k = 0; k < n; ++k) {
+        const size_t i = candidates != nullptr ? (*candidates)[k] : k;
+        if (!file.IsFirstOfName(i)) continue;
+        uint32_t ret = visit(i);
+        if (ret != 0) return ret;
+    }
+    return 0;
+}
+
 // Drops this thread's parse of path (a writer of this thread has just replaced the file).
 void SectionFileForget(const char *path);
 

@@ -101,12 +101,8 @@ uint32_t LoadByName(int32_t tid, ORLOiSCSIAclList *list) {
 
 uint32_t LoadEntries(int32_t tid, ORLOiSCSIAclList *list) {
     if (OLIBCFileExist(kAclConfPath) != 1) return ORLO_OK;  // no file: no entries
-    const orlo::olibc::ErrState before = orlo::olibc::ErrState::Save();
-    std::shared_ptr<const SectionFile> file = orlo::olibc::SectionFileLoad(kAclConfPath);
-    if (file == nullptr || !file->IsPlain()) {
-        before.Restore();
-        return LoadByName(tid, list);
-    }
+    std::shared_ptr<const SectionFile> file = orlo::olibc::PlainSectionFileLoad(kAclConfPath);
+    if (file == nullptr) return LoadByName(tid, list);
     std::vector<uint32_t> candidates;
     bool indexed = false;
     try {
@@ -118,22 +114,19 @@ uint32_t LoadEntries(int32_t tid, ORLOiSCSIAclList *list) {
         ORLO_LOG_ERR("OLIBCSzHashAlloc(%d) failed", kHashSize);
         return ORLO_ERR_OUT_OF_MEMORY;
     }
-    for (uint32_t i : candidates) {
-        if (!file->IsFirstOfName(i)) continue;  // readers by name see the first of a name
+    return orlo::olibc::ForEachNamedSection(*file, &candidates, [&](size_t i) -> uint32_t {
         const char *section = file->Name(i);
         int32_t sectionTid = 0;
         const char *initiator = nullptr;
-        if (!IsEntryOf(section, tid, &sectionTid, &initiator)) continue;
+        if (!IsEntryOf(section, tid, &sectionTid, &initiator)) return ORLO_OK;
         const OLIBC_SZHASH *hash = file->Hash(i);
         if (hash == nullptr) {
             ORLO_LOG_ERR("OLIBCFileGetSection(\"%s\", \"%s\", %p) failed, ret=%d", kAclConfPath, section,
                          static_cast<const void *>(hash), -1);
             return ORLO_ERR_GET_SECTION;
         }
-        uint32_t ret = Append(section, hash, sectionTid, initiator, list);
-        if (ret != ORLO_OK) return ret;
-    }
-    return ORLO_OK;
+        return Append(section, hash, sectionTid, initiator, list);
+    });
 }
 
 }  // namespace

@@ -103,32 +103,23 @@ bool Narrow(const SectionFile &file, const ORLOiSCSITargetFilter *filter, std::v
 
 uint32_t Load(const ORLOiSCSITargetFilter *filter, ORLOiSCSITargetList *list) {
     if (OLIBCFileExist(kConfPath) != 1) return ORLO_OK;  // no file: no targets
-    const orlo::olibc::ErrState before = orlo::olibc::ErrState::Save();
-    std::shared_ptr<const SectionFile> file = orlo::olibc::SectionFileLoad(kConfPath);
-    if (file == nullptr || !file->IsPlain()) {
-        before.Restore();
-        return LoadByName(filter, list);
-    }
+    std::shared_ptr<const SectionFile> file = orlo::olibc::PlainSectionFileLoad(kConfPath);
+    if (file == nullptr) return LoadByName(filter, list);
     std::vector<uint32_t> picked;
     const std::vector<uint32_t> *candidates = nullptr;
     if (!Narrow(*file, filter, &picked, &candidates)) {
         ORLO_LOG_ERR("Failed to index %s, errno=0X%X", kConfPath, static_cast<unsigned>(OLIBCErrGet()));
         return ORLO_ERR_OUT_OF_MEMORY;
     }
-    const size_t n = candidates != nullptr ? candidates->size() : file->Count();
-    for (size_t k = 0; k < n; ++k) {
-        const size_t i = candidates != nullptr ? (*candidates)[k] : k;
-        if (!file->IsFirstOfName(i)) continue;  // readers by name see the first of a name
+    return orlo::olibc::ForEachNamedSection(*file, candidates, [&](size_t i) -> uint32_t {
         const OLIBC_SZHASH *section = file->Hash(i);
         if (section == nullptr) {
             ORLO_LOG_ERR("OLIBCFileGetSection(\"%s\", \"%s\", %p) failed, ret=%d", kConfPath, file->Name(i),
                          static_cast<const void *>(section), -1);
             return ORLO_ERR_GET_SECTION;
         }
-        uint32_t ret = Accept(filter, section, list);
-        if (ret != ORLO_OK) return ret;
-    }
-    return ORLO_OK;
+        return Accept(filter, section, list);
+    });
 }
 
 }  // namespace

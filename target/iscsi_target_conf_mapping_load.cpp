@@ -107,31 +107,22 @@ uint32_t LoadByName(const ORLOiSCSILunFilter *filter, ORLOiSCSIMappingList *list
 
 uint32_t LoadSections(const ORLOiSCSILunFilter *filter, ORLOiSCSIMappingList *list) {
     if (OLIBCFileExist(kMappingConfPath) != 1) return ORLO_OK;  // no file: no mappings
-    const orlo::olibc::ErrState before = orlo::olibc::ErrState::Save();
-    std::shared_ptr<const SectionFile> file = orlo::olibc::SectionFileLoad(kMappingConfPath);
-    if (file == nullptr || !file->IsPlain()) {
-        before.Restore();
-        return LoadByName(filter, list);
-    }
+    std::shared_ptr<const SectionFile> file = orlo::olibc::PlainSectionFileLoad(kMappingConfPath);
+    if (file == nullptr) return LoadByName(filter, list);
     const std::vector<uint32_t> *candidates = nullptr;
     if (!Narrow(*file, filter, &candidates)) {
         ORLO_LOG_ERR("Failed to alloc for %s, errno=0X%X", kMappingConfPath, static_cast<unsigned>(OLIBCErrGet()));
         return ORLO_ERR_OUT_OF_MEMORY;
     }
-    const size_t n = candidates != nullptr ? candidates->size() : file->Count();
-    for (size_t k = 0; k < n; ++k) {
-        const size_t i = candidates != nullptr ? (*candidates)[k] : k;
-        if (!file->IsFirstOfName(i)) continue;  // readers by name see the first of a name
+    return orlo::olibc::ForEachNamedSection(*file, candidates, [&](size_t i) -> uint32_t {
         const OLIBC_SZHASH *section = file->Hash(i);
         if (section == nullptr) {
             ORLO_LOG_ERR("Failed to get section '%s' of %s, errno=0X%X", file->Name(i), kMappingConfPath,
                          static_cast<unsigned>(OLIBCErrGet()));
             return ORLO_ERR_GET_SECTION;
         }
-        uint32_t ret = Accept(filter, section, list);
-        if (ret != ORLO_OK) return ret;
-    }
-    return ORLO_OK;
+        return Accept(filter, section, list);
+    });
 }
 
 }  // namespace
