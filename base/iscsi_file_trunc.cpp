@@ -27,7 +27,8 @@ char gZeros[kZeroChunk];
 bool ProgressStart(uint64_t total) {
     char path[64];
     snprintf(path, sizeof(path), ORLO_ISCSI_FILE_PROGRESS_PATH_FMT, static_cast<int>(getpid()));
-    if (orlo::os::Unlink(path) != 0 && errno != ENOENT)
+    // ENOTDIR: the runtime directory is not a directory, so there is no old file either.
+    if (orlo::os::Unlink(path) != 0 && errno != ENOENT && errno != ENOTDIR)
         ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", path);
     char value[32];
     snprintf(value, sizeof(value), "%" PRIu64, total);

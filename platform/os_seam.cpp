@@ -48,6 +48,98 @@ class Mapped {
     bool ok_;
 };
 
+bool IsFailure(int r) { return r < 0; }
+bool IsFailure(FILE *f) { return f == nullptr; }
+
+// Directories every appliance has from its first boot on (the runtime tree under
+// /tmp/iscsi is made by the library at start-up and kept).  Under a sandbox root they may
+// be missing: a fresh "mktemp -d" is a valid root.  A call that makes something beneath
+// one of them and fails because it is missing makes the directory (with its parents,
+// inside the root only) and tries once more.  Mount points (/config, /volumeN) are not
+// among them on purpose: making one would hide a missing mount and let the library write
+// plain files where the kernel or a volume was meant to be.
+struct StandingDir {
+    const char *path;
+    mode_t mode;
+};
+const StandingDir kStandingDirs[] = {
+    {"/tmp", 01777},
+    {"/tmp/iscsi", 0700},
+    {"/tmp/iscsi/lun_lock", 0700},
+    {"/tmp/iscsi/lun_unsync", 0700},
+    {"/tmp/iscsi/snapshot_conf_lock", 0700},
+    {"/tmp/iscsi/snapshot_cache", 0700},
+    {"/tmp/iscsi/snapshot_lock", 0700},
+    {"/tmp/iscsi/snapshot_cache_lock", 0700},
+    {"/tmp/iscsi/snapshot_app_lock", 0700},
+    {"/tmp/iscsi/snapshot_unsync_lock", 0700},
+    {"/usr/orlo/etc", 0755},
+    {"/usr/orlo/plugins", 0755},
+    {"/etc", 0755},
+    {"/etc/cron.d", 0755},
+    {"/etc.defaults", 0755},
+    {"/root", 0700},
+    {"/var/run", 0755},
+    {"/var/log", 0755},
+    {"/var/lock", 0755},
+    {"/var/crash", 0700},
+    {"/var/target", 0700},
+};
+
+mode_t StandingMode(const std::string &logical) {
+    for (const StandingDir &d : kStandingDirs)
+        if (logical == d.path) return d.mode;
+    return 0755;
+}
+
+// Makes, under the sandbox root, the standing directory that holds logical (the longest
+// one that is a proper prefix of it), component by component.  True when it is there
+// afterwards; false on the appliance itself (no root), for a path under no standing
+// directory, or when it cannot be made.  errno is kept.
+bool MakeStandingParent(const char *logical) {
+    int saved = errno;
+    std::string root = SysRoot();
+    if (root.empty() || logical == nullptr || logical[0] != '/') return false;
+    struct stat st;
+    if (::stat(root.c_str(), &st) != 0 || !S_ISDIR(st.st_mode)) {
+        errno = saved;
+        return false;  // the root itself is never made
+    }
+    const StandingDir *best = nullptr;
+    size_t bestLen = 0;
+    for (const StandingDir &d : kStandingDirs) {
+        size_t n = strlen(d.path);
+        if (n > bestLen && strncmp(logical, d.path, n) == 0 && logical[n] == '/') {
+            best = &d;
+            bestLen = n;
+        }
+    }
+    bool ok = best != nullptr;
+    for (size_t i = 1; ok && i <= bestLen; ++i) {
+        if (i < bestLen && best->path[i] != '/') continue;
+        std::string part(best->path, i);
+        std::string mapped = root + part;
+        mode_t mode = StandingMode(part);
+        if (::mkdir(mapped.c_str(), mode) == 0) {
+            ::chmod(mapped.c_str(), mode);  // the umask may have taken bits (/tmp's sticky bit)
+        } else if (errno != EEXIST) {
+            ok = false;
+        }
+    }
+    ok = ok && ::stat((root + best->path).c_str(), &st) == 0 && S_ISDIR(st.st_mode);
+    errno = saved;
+    return ok;
+}
+
+// Runs a call that makes logical (or something in its directory); when it fails for a
+// missing standing directory, makes that directory and runs the call once more.
+template <typename Call>
+auto MakingStandingParent(const char *logical, Call call) -> decltype(call()) {
+    auto r = call();
+    if (IsFailure(r) && errno == ENOENT && MakeStandingParent(logical)) r = call();
+    return r;
+}
+
 }  // namespace
 
 std::string SysRoot() {
@@ -100,19 +192,21 @@ std::string Unmap(const char *mapped) {
 
 int Open(const char *path, int flags, mode_t mode) {
     ORLO_MAP_OR_FAIL(m, path, -1);
-    return ::open(m.c_str(), flags, mode);
+    if ((flags & O_CREAT) == 0) return ::open(m.c_str(), flags, mode);
+    return MakingStandingParent(path, [&] { return ::open(m.c_str(), flags, mode); });
 }
 
 int OpenAt(int dirfd, const char *name, int flags, mode_t mode) { return ::openat(dirfd, name, flags, mode); }
 
 FILE *Fopen(const char *path, const char *mode) {
     ORLO_MAP_OR_FAIL(m, path, nullptr);
-    return ::fopen(m.c_str(), mode);
+    if (mode == nullptr || (mode[0] != 'w' && mode[0] != 'a')) return ::fopen(m.c_str(), mode);
+    return MakingStandingParent(path, [&] { return ::fopen(m.c_str(), mode); });
 }
 
 int Mkdir(const char *path, mode_t mode) {
     ORLO_MAP_OR_FAIL(m, path, -1);
-    return ::mkdir(m.c_str(), mode);
+    return MakingStandingParent(path, [&] { return ::mkdir(m.c_str(), mode); });
 }
 
 int Rmdir(const char *path) {
@@ -134,7 +228,7 @@ int Rename(const char *from, const char *to) {
 int Symlink(const char *target, const char *link) {
     ORLO_MAP_OR_FAIL(t, target, -1);
     ORLO_MAP_OR_FAIL(l, link, -1);
-    return ::symlink(t.c_str(), l.c_str());
+    return MakingStandingParent(link, [&] { return ::symlink(t.c_str(), l.c_str()); });
 }
 
 ssize_t Readlink(const char *path, char *buf, size_t size) {
@@ -185,7 +279,10 @@ int Mkstemp(char *tmpl) {
     }
     char mapped[PATH_MAX];
     if (MapPath(tmpl, mapped, sizeof(mapped)) != 0) return -1;
-    int fd = ::mkstemp(mapped);
+    int fd = MakingStandingParent(tmpl, [&] {
+        memcpy(mapped + strlen(mapped) - 6, "XXXXXX", 6);  // a failed mkstemp may leave its guess
+        return ::mkstemp(mapped);
+    });
     if (fd < 0) return -1;
     memcpy(tmpl + len - 6, mapped + strlen(mapped) - 6, 6);  // same suffix, logical prefix
     return fd;
@@ -193,7 +290,7 @@ int Mkstemp(char *tmpl) {
 
 int Mkfifo(const char *path, mode_t mode) {
     ORLO_MAP_OR_FAIL(m, path, -1);
-    return ::mkfifo(m.c_str(), mode);
+    return MakingStandingParent(path, [&] { return ::mkfifo(m.c_str(), mode); });
 }
 
 int Statvfs(const char *path, struct statvfs *st) {

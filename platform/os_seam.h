@@ -8,6 +8,13 @@
  * same way and run without a shell.  Callers always pass, log and return the logical
  * (appliance) path; only the seam sees the mapped one.
  *
+ * Under a sandbox root the directories every appliance has (/tmp, /tmp/iscsi and its
+ * lock directories, /usr/orlo/etc, /etc, /etc.defaults, /root, /var/run, /var/log, ...)
+ * may be missing: a call that creates something beneath one of them (Open with O_CREAT,
+ * Fopen for writing, Mkdir, Mkstemp, Mkfifo, Symlink) makes that directory inside the
+ * root first when it has to.  Mount points (/config, /volumeN) are never made.  On the
+ * appliance itself (no root) nothing is ever made implicitly.
+ *
  * Nothing outside platform/ calls open, fopen, mkdir, stat, opendir, symlink, rename,
  * exec* or popen directly; a lint test keeps it so.  All functions are thread-safe and
  * set errno as the system call they wrap does (ENAMETOOLONG when a mapped path does

@@ -172,7 +172,9 @@ TEST_F(FileUtilTest, ZeroFillingAppendsZerosAndWritesTheProgressFile) {
 }
 
 TEST_F(FileUtilTest, GrowingGoesOnWithoutAProgressFileAndSaysSoOnce) {
-    rmdir(Real("/tmp/iscsi").c_str());  // the runtime directories were never made
+    // The runtime directory cannot be used (something else took its name).
+    ASSERT_EQ(0, rmdir(Real("/tmp/iscsi").c_str()));
+    WriteFile("/tmp/iscsi", "not a directory");
     for (unsigned int mode : {ORLO_ISCSI_TRUNC_MODE_ZERO, ORLO_ISCSI_TRUNC_MODE_ALLOC}) {
         log_.Clear();
         std::string name = "/volume1/lun" + std::to_string(mode);
