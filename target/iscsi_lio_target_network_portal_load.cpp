@@ -5,9 +5,15 @@
 //    where the target listens (the administrator chose; interface addresses are not
 //    added), each entry on its own port;
 //  - else every interface that is up with a link, or up with a static address,
-//    contributes its IPv4 address and its IPv6 addresses, each on port 3260.
+//    contributes its IPv4 address and its global IPv6 addresses, each on port 3260.
+//    Link-local IPv6 addresses (fe80::/10) are left out: discovery hands portals to
+//    initiators without their scope, so no initiator could log in through one. An
+//    administrator who wants one lists it in network_portals with its scope.
 // A portal that cannot be made is logged and the others are still made; the result is
 // the first failure.
+#include <arpa/inet.h>
+#include <netinet/in.h>
+
 #include <cstdio>
 #include <cstring>
 #include <vector>
@@ -53,6 +59,13 @@ uint32_t ConfiguredPortals(const ORLOiSCSITarget *target) {
     return first;
 }
 
+// fe80::/10: the first ten bits 1111111010, i.e. a first group fe80..febf.
+bool IsLinkLocalV6(const char *addr) {
+    struct in6_addr a;
+    if (inet_pton(AF_INET6, addr, &a) != 1) return false;
+    return IN6_IS_ADDR_LINKLOCAL(&a);
+}
+
 uint32_t InterfacePortals(const ORLOiSCSITarget *target) {
     std::vector<OLIB_NET_IFINFO> ifaces(NUM_MAXIFACES);
     int n = OLIBNetGetInterfaceInfo(ifaces.data(), NUM_MAXIFACES,
@@ -78,14 +91,8 @@ uint32_t InterfacePortals(const ORLOiSCSITarget *target) {
         }
         for (int j = 0; j < m; ++j) {
             const ORLO_V6_IP &ip = v6[static_cast<size_t>(j)];
-            // A link-local address names its interface; the scope travels inside the
-            // brackets of the portal's name.
-            char addr[sizeof(ip.szIP) + 16];
-            if (ip.scopeId != 0)
-                snprintf(addr, sizeof(addr), "%s%%%d", ip.szIP, ip.scopeId);
-            else
-                snprintf(addr, sizeof(addr), "%s", ip.szIP);
-            AddPortal(target, addr, lio::kIscsiPort, &first);
+            if (IsLinkLocalV6(ip.szIP)) continue;
+            AddPortal(target, ip.szIP, lio::kIscsiPort, &first);
         }
     }
     return first;
