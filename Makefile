@@ -1,6 +1,7 @@
 # Developer and CI entry points.
 #   make test        install missing Debian packages, build (-Werror) and run every test
 #   make test-asan   the same suite built with AddressSanitizer and UBSan
+#   make demo        the system's main job end to end in a sandbox root (as root)
 #   make bench       build and run the benchmarks
 #   make install     install library, headers, CMake package and pkg-config file
 
@@ -15,7 +16,7 @@ DEB_PACKAGES = build-essential cmake pkg-config libgtest-dev libgmock-dev libben
 
 SUDO := $(shell [ "$$(id -u)" = 0 ] || echo sudo)
 
-.PHONY: all deps configure build test test-asan bench install clean
+.PHONY: all deps configure build test test-asan demo bench install clean
 
 all: build
 
@@ -42,6 +43,9 @@ test-asan: deps
 	cmake --build $(ASAN_BUILD) -j $(JOBS)
 	cd $(ASAN_BUILD) && ASAN_OPTIONS=detect_leaks=1 UBSAN_OPTIONS=print_stacktrace=1 \
 	  ctest --output-on-failure -j $(JOBS) --timeout 900
+
+demo: build
+	$(SUDO) tools/demo/orlo-demo.sh $(BUILD)/bin
 
 bench: build
 	@for b in $(BUILD)/bin/*_bench; do echo "== $$b"; $$b || exit 1; done
