@@ -7,9 +7,11 @@
 #define ORLO_BASE_ISCSI_BASE_INTERNAL_H
 
 #include <dirent.h>
+#include <errno.h>
 #include <stdio.h>
 #include <unistd.h>
 
+#include <string>
 #include <utility>
 #include <vector>
 
@@ -150,6 +152,45 @@ class FileLockGuard {
     const char *path_;
     int handle_ = -1;
 };
+
+// Why a lock file could not be taken, for the end of the "Failed to lock file" line: ""
+// when it was busy until the time-out (err ETIMEDOUT), otherwise what stands in its place
+// (" It is a symbolic link, not a regular file." ...) or the errno text.  A lock file that
+// is not a regular file is never followed or replaced: it blocks every user until an
+// administrator removes it, so the line says exactly what it is.
+std::string LockFailureDetail(const char *lockPath, int err);
+
+// Whether the last failed lock attempt (errno err) was a time-out rather than a lock file
+// that cannot be used.
+inline bool LockTimedOut(int err) { return err == ETIMEDOUT || err == EWOULDBLOCK || err == EINTR; }
+
+// Holds a lock file for the scope and may be taken again by the same thread while held
+// (each nested take is free and the file is released when the outermost guard goes).
+// Used for the locks that an operation takes and then calls other operations that take
+// them too; another thread or process is excluded as by FileLockGuard.
+class ReentrantLockGuard {
+  public:
+    ReentrantLockGuard(const char *lockPath, int timeoutSec);
+    ReentrantLockGuard(const ReentrantLockGuard &) = delete;
+    ReentrantLockGuard &operator=(const ReentrantLockGuard &) = delete;
+    ~ReentrantLockGuard();
+    bool held() const { return held_; }
+
+  private:
+    std::string path_;
+    bool held_ = false;
+};
+
+// The target lock: any change to targets, their mappings or access lists, in the files
+// and in the kernel, and the deletion or unloading of a LUN (which must not race a
+// mapping), runs under it, so that picking a free tid, name or LUN number and writing it
+// are one step, and the kernel and the files never see two changes interleaved.  See
+// docs/locks.md for where it stands in the lock order.
+constexpr const char kTargetLockPath[] = "/tmp/iscsi/iscsi_target_op.lock";
+constexpr int kTargetLockTimeoutSec = 60;
+
+// Whether the n bytes at s are well-formed UTF-8 (no overlong forms, no surrogates).
+bool IsUtf8(const char *s, size_t n);
 
 // The numbers of the data volumes "/volumeN" at the root, ascending, into *out.  0, or
 // 18990026 when the root cannot be listed (logged).

@@ -77,7 +77,12 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSIRemoveSectionList(const char *path, con
         return ORLO_ERR_BAD_FILE_TYPE;
     }
 
-    int tmpFd = orlo::os::Mkstemp(tmpPath);
+    // Temporary files of writers killed before their rename go first; ours keeps a flock
+    // for its whole life so that other writers leave it alone.
+    orlo::olibc::SweepReplacements(path);
+    std::string tmpName(tmpPath);
+    int tmpFd = orlo::olibc::MakeReplacement(&tmpName);
+    if (tmpFd >= 0) memcpy(tmpPath, tmpName.c_str(), tmpName.size() + 1);
     if (tmpFd < 0) {
         ORLO_LOG_ERR("Failed to mkstemp file: %s", tmpPath);
         return ORLO_ERR_OPEN_FILE;

@@ -32,6 +32,16 @@ void OrloLog(int priority, const char *format, ...) __attribute__((format(printf
         OLIBCErrSet(OLIBC_ERR_BAD_PARAM);        \
     } while (0)
 
+// A lock file that could not be taken: the usual line, with the reason at its end when
+// the lock was not simply busy (see orlo::LockFailureDetail).  Reads errno first.
+#define ORLO_LOG_LOCK_FAILED(path)                                                         \
+    do {                                                                                   \
+        int orloLockErr_ = errno;                                                          \
+        const char *orloLockPath_ = (path);                                                \
+        std::string orloLockWhy_ = orlo::LockFailureDetail(orloLockPath_, orloLockErr_);   \
+        ORLO_LOG_ERR("Failed to lock file: %s.%s", orloLockPath_, orloLockWhy_.c_str());   \
+    } while (0)
+
 // A failed platform call: its text, then the platform error, file and line.
 #define ORLO_LOG_PLATFORM(fmt, ...)                                                          \
     do {                                                                                     \

@@ -12,7 +12,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSIEpJournalLock(int32_t *fd) {
     static const char kPath[] = "/tmp/ep_journal_access.lock";
     int handle = -1;
     if (!OLIBCFileLockTimeByFile(kPath, 1, -1, &handle)) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", kPath);
+        ORLO_LOG_LOCK_FAILED(kPath);
         return ORLO_ERR_LOCK_FILE;
     }
     *fd = handle;

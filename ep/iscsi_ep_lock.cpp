@@ -16,7 +16,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSIEpLock(int32_t *fd, int volumeNumber) {
     if (ret != ORLO_OK) return ret;
     int handle = -1;
     if (!OLIBCFileLockTimeByFile(path, 1, -1, &handle)) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", path);
+        ORLO_LOG_LOCK_FAILED(path);
         return ORLO_ERR_LOCK_FILE;
     }
     *fd = handle;

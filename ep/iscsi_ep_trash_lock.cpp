@@ -19,7 +19,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSIEpTrashLock(int32_t *fd, const char *vo
     if (ret != ORLO_OK) return ret;
     int handle = -1;
     if (!OLIBCFileLockTimeByFile(path, 1, -1, &handle)) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", path);
+        ORLO_LOG_LOCK_FAILED(path);
         return ORLO_ERR_LOCK_FILE;
     }
     *fd = handle;

@@ -233,7 +233,7 @@ uint32_t LoadByPath(const ORLOiSCSILunFilter *filter, ORLOiSCSILunList *list, co
     {
         orlo::FileLockGuard lock(orlo::lun::kConfLockPath, false, orlo::lun::kConfLockTimeoutSec);
         if (!lock.held()) {
-            ORLO_LOG_ERR("Failed to lock file: %s.", orlo::lun::kConfLockPath);
+            ORLO_LOG_LOCK_FAILED(orlo::lun::kConfLockPath);
             ret = ORLO_ERR_LOCK_FILE;
         } else {
             const orlo::olibc::ErrState before = orlo::olibc::ErrState::Save();

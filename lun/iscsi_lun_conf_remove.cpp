@@ -16,7 +16,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSILunConfRemove(const ORLOiSCSILun *lun) 
     }
     orlo::FileLockGuard lock(orlo::lun::kConfLockPath, true, orlo::lun::kConfLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", orlo::lun::kConfLockPath);
+        ORLO_LOG_LOCK_FAILED(orlo::lun::kConfLockPath);
         return ORLO_ERR_LOCK_FILE;
     }
     uint32_t ret = ORLOiSCSILunGlobalConfRemove(lun);

@@ -51,6 +51,7 @@ const char *NameFault(const ORLOiSCSILun *lun) {
         if (c < 0x20 || c == 0x7F) return "control character";
     }
     if (strchr(lun->name, ']') != nullptr) return "holds \"]\"";
+    if (!orlo::IsUtf8(lun->name, n)) return "not UTF-8";
     if (lun->name[0] == ' ' || lun->name[0] == '\t') return "leading blank";
     if (n >= 2 && lun->name[0] == '"' && lun->name[n - 1] == '"') return "enclosed in double quotes";
     return nullptr;
@@ -183,6 +184,7 @@ class Creation {
     bool madePool_ = false;
     std::string madeDataFile_;
     bool sectionsTried_ = false;
+    bool pendingRecorded_ = false;
     bool volumeHadSection_ = false;
     bool volumeConfExisted_ = true;
 };
@@ -199,11 +201,20 @@ uint32_t Creation::Run() {
     }
     creationLock_.emplace(kCreationLockPath, true, kCreationLockTimeoutSec);
     if (!creationLock_->held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", kCreationLockPath);
+        ORLO_LOG_LOCK_FAILED(kCreationLockPath);
         return ORLO_ERR_LOCK_FILE;
     }
+    // Whatever a killed creation or deletion left half-done is settled first, so that
+    // the count, the names and the lids below are those of finished LUNs.
+    RecoverPending(true);
     ret = Identify();
     if (ret != ORLO_OK) return ret;
+    // From here on this creation makes things: recorded first, so that a process killed
+    // before its sections are written is rolled back by the next creation, deletion or
+    // service start.
+    ret = RecordPending(lun_, "create");
+    if (ret != ORLO_OK) return ret;
+    pendingRecorded_ = true;
     if (fileBacked_) {
         ret = MakeDirectory();
         if (ret != ORLO_OK) return ret;
@@ -378,7 +389,7 @@ uint32_t Creation::WriteSections() {
 void Creation::RemoveSections() {
     orlo::FileLockGuard lock(kConfLockPath, true, kConfLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", kConfLockPath);
+        ORLO_LOG_LOCK_FAILED(kConfLockPath);
         return;
     }
     // The uuid was checked to be new in the global file: its section there is ours.
@@ -446,6 +457,13 @@ void Creation::Finish(uint32_t result) {
         OLIBPluginExit(plugin_);
         plugin_ = nullptr;
     }
+    // Done either way: finished, or undone above.
+    if (pendingRecorded_) ClearPending(lun_->uuid);
+    // The zero filling's progress ends with the creation.
+    char progress[64];
+    snprintf(progress, sizeof(progress), ORLO_ISCSI_FILE_PROGRESS_PATH_FMT, static_cast<int>(getpid()));
+    if (orlo::os::Unlink(progress) != 0 && errno != ENOENT && errno != ENOTDIR)
+        ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", progress);
     if (lunLocked_) {
         if (ORLOiSCSILunUnlock(lun_) != ORLO_OK)
             ORLO_LOG_ERR("Failed to unlock LUN. lid: %d, name: %s", lun_->lid, lun_->name);

@@ -164,6 +164,10 @@ uint32_t DeleteLocked(ORLOiSCSILun *lun, bool *inTrash) {
 
 }  // namespace
 
+namespace {
+uint32_t DeleteUnmapped(ORLOiSCSILun *lun, bool *inTrash, uint32_t *first);
+}  // namespace
+
 extern "C" ORLO_EXPORT uint32_t ORLOiSCSILunDelete(ORLOiSCSILun *lun) {
     if (lun == nullptr) {
         ORLO_LOG_BAD_PARAMS();
@@ -177,6 +181,39 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSILunDelete(ORLOiSCSILun *lun) {
         ORLO_LOG_ERR("invalid LUN root path. lid: %d", lun->lid);
         return ORLO_ERR_BAD_PARAMETER;
     }
+    // What killed creations and deletions left is settled first (not while a creation
+    // runs: its process does it).
+    orlo::lun::RecoverPending(false);
+    bool inTrash = false;
+    uint32_t first = ORLO_OK;
+    {
+        // Under the target lock no mapping of this LUN can appear between the check and
+        // the removal of its sections.  Released before the background release starts:
+        // that process must not inherit it.
+        orlo::ReentrantLockGuard targetLock(orlo::kTargetLockPath, orlo::kTargetLockTimeoutSec);
+        if (!targetLock.held()) {
+            ORLO_LOG_LOCK_FAILED(orlo::kTargetLockPath);
+            return ORLO_ERR_LOCK_FILE;
+        }
+        uint32_t ret = DeleteUnmapped(lun, &inTrash, &first);
+        if (ret != ORLO_OK) return ret;
+    }
+    if (inTrash) {
+        uint32_t ret = ORLOiSCSILunUnmapALUNInBackground(lun->rootPath);
+        if (ret != ORLO_OK) {
+            ORLO_LOG_ERR("ORLOiSCSILunUnmapALUNInBackground(\"%s\") failed, err=%s", lun->rootPath,
+                         ORLOiSCSIErrStr(ret));
+            Remember(&first, ret);
+        }
+    }
+    return first;
+}
+
+namespace {
+
+// The deletion of a LUN no target maps, under its lock.  The refusal's code, else 0 with
+// the result of the deletion in *first.
+uint32_t DeleteUnmapped(ORLOiSCSILun *lun, bool *inTrash, uint32_t *first) {
     int mapped = 0;
     uint32_t ret = ORLOiSCSILunIsMapped(lun, &mapped);
     if (ret != ORLO_OK) {
@@ -194,20 +231,22 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSILunDelete(ORLOiSCSILun *lun) {
                      ORLOiSCSIErrStr(ret));
         return ret;
     }
-    bool inTrash = false;
-    uint32_t first = DeleteLocked(lun, &inTrash);
-    if (first == ORLO_OK) RemoveLockFile(lun);
+    // Recorded while the LUN's lock is held, so that recovery can tell a deletion under
+    // way (lock busy) from one whose process was killed (lock free).
+    ret = orlo::lun::RecordPending(lun, "delete");
+    if (ret != ORLO_OK) {
+        *first = ret;
+    } else {
+        *first = DeleteLocked(lun, inTrash);
+        if (*first == ORLO_OK) {
+            orlo::lun::ClearPending(lun->uuid);
+            RemoveLockFile(lun);
+        }
+    }
     ret = ORLOiSCSILunUnlock(lun);
     if (ret != ORLO_OK)
         ORLO_LOG_ERR("ORLOiSCSILunUnlock(%p) failed, err=%s", static_cast<void *>(lun), ORLOiSCSIErrStr(ret));
-    // Started only now: the background process must not inherit a held LUN lock.
-    if (inTrash) {
-        ret = ORLOiSCSILunUnmapALUNInBackground(lun->rootPath);
-        if (ret != ORLO_OK) {
-            ORLO_LOG_ERR("ORLOiSCSILunUnmapALUNInBackground(\"%s\") failed, err=%s", lun->rootPath,
-                         ORLOiSCSIErrStr(ret));
-            Remember(&first, ret);
-        }
-    }
-    return first;
+    return ORLO_OK;
 }
+
+}  // namespace

@@ -29,7 +29,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSILunIsMapped(const ORLOiSCSILun *lun, in
     *mapped = 0;
     orlo::FileLockGuard lock(kMappingLockPath, false, kLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", kMappingLockPath);
+        ORLO_LOG_LOCK_FAILED(kMappingLockPath);
         return ORLO_ERR_LOCK_FILE;
     }
     if (!OLIBCFileExist(kMappingConfPath)) return ORLO_OK;

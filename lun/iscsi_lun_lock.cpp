@@ -58,7 +58,7 @@ uint32_t WriteProgress(const ORLOiSCSILun *lun, int step) {
     }
     orlo::FileLockGuard lock(path, true, kProgressLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", path);
+        ORLO_LOG_LOCK_FAILED(path);
         return ORLO_ERR_LOCK_FILE;
     }
     // Taking the lock made the file; if nothing is written into it, it goes again.
@@ -113,12 +113,15 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSILunLock(ORLOiSCSILun *lun, int step) {
         // Step 5 may find the LUN busy: it goes on without the lock (and without touching
         // the holder's progress file).
         if (step == ORLO_ISCSI_LUN_STEP_5) return ORLO_OK;
-        ORLO_LOG_ERR("Failed to lock file: %s.", lockPath);
-        return orlo::lun::kErrLunLocked;
+        // Busy for the whole wait: another operation holds the LUN.  Anything else (a
+        // symbolic link or a directory where the lock file belongs) is not a busy LUN.
+        const bool busy = orlo::LockTimedOut(errno);
+        ORLO_LOG_LOCK_FAILED(lockPath);
+        return busy ? orlo::lun::kErrLunLocked : static_cast<uint32_t>(ORLO_ERR_LOCK_FILE);
     }
     if (handle == 0) {
         // A handle of 0 cannot be told from "not locked" later: refuse to hold it.
-        ORLO_LOG_ERR("Failed to lock file: %s.", lockPath);
+        ORLO_LOG_LOCK_FAILED(lockPath);
         OLIBCFileUnlockByFile(handle);
         return ORLO_ERR_LOCK_FILE;
     }

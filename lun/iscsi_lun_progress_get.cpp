@@ -44,7 +44,7 @@ uint32_t ProbeLock(const ORLOiSCSILun *lun, int32_t *locked) {
         *locked = 1;
         return ORLO_OK;
     }
-    ORLO_LOG_ERR("Failed to lock file: %s.", lockPath);
+    ORLO_LOG_LOCK_FAILED(lockPath);
     return ORLO_ERR_LOCK_FILE;
 }
 
@@ -57,7 +57,7 @@ uint32_t ReadProgress(const ORLOiSCSILun *lun, ORLOiSCSILunProgress *progress) {
     if (orlo::os::Access(path, F_OK) != 0) return ORLO_OK;  // no operation published
     orlo::FileLockGuard lock(path, true, kProgressLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", path);
+        ORLO_LOG_LOCK_FAILED(path);
         return ORLO_ERR_LOCK_FILE;
     }
     orlo::FileGuard file(orlo::os::Fopen(path, "r"));

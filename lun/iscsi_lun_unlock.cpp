@@ -19,7 +19,7 @@ void RemoveProgress(const ORLOiSCSILun *lun) {
         return;
     }
     orlo::FileLockGuard lock(path, true, kProgressLockTimeoutSec);
-    if (!lock.held()) ORLO_LOG_ERR("Failed to lock file: %s.", path);
+    if (!lock.held()) ORLO_LOG_LOCK_FAILED(path);
     // Removed even without its lock: a progress file outliving its operation would tell
     // readers of an operation that no longer runs.
     if (orlo::os::Unlink(path) != 0 && errno != ENOENT)

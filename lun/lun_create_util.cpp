@@ -61,7 +61,7 @@ uint32_t LoadIdentities(std::vector<LunIdentity> *luns) {
     luns->clear();
     FileLockGuard lock(kConfLockPath, false, kConfLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", kConfLockPath);
+        ORLO_LOG_LOCK_FAILED(kConfLockPath);
         return ORLO_ERR_LOCK_FILE;
     }
     olibc::FileImage image;

@@ -63,6 +63,19 @@ uint32_t VolumeConfPath(const char *volume, char *buf, size_t size);
 bool LockFilePath(const ORLOiSCSILun *lun, char *buf, size_t size);
 bool ProgressFilePath(const ORLOiSCSILun *lun, char *buf, size_t size);
 
+// ---- Creations and deletions under way (lun_pending.cpp) ----
+// The journal of LUN creations and deletions under way, guarded by the LUN files' lock.
+constexpr const char *kPendingConfPath = "/usr/orlo/etc/iscsi_lun_pending.conf";
+// Records that op ("create" or "delete") is about to change the LUN: its section
+// "PENDING_<uuid>" with what recovery needs to finish or undo it.  0 or a code (logged).
+uint32_t RecordPending(const ORLOiSCSILun *lun, const char *op);
+// Removes the LUN's record (a missing one is fine).
+void ClearPending(const char *uuid);
+// Finishes or undoes the operations whose process is gone and removes stale progress
+// files.  creationLockHeld: the caller holds the LUN creation lock; otherwise it is tried
+// without waiting and recovery is left to its holder when busy.
+void RecoverPending(bool creationLockHeld);
+
 }  // namespace lun
 }  // namespace orlo
 

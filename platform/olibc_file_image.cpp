@@ -240,7 +240,8 @@ int ReplaceFile(const char *path, const struct stat *st, std::string_view conten
         OLIBCErrSet(OLIBC_ERR_TOO_LONG);
         return -1;
     }
-    int fd = os::Mkstemp(&tmp[0]);
+    SweepReplacements(path);
+    int fd = MakeReplacement(&tmp);
     if (fd < 0) {
         OLIBCErrSet(CodeOfErrno(errno, OLIBC_ERR_CONF));
         return -1;

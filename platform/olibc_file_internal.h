@@ -37,6 +37,15 @@
 namespace orlo {
 namespace olibc {
 
+// ---- Temporary files that replace a file ----
+// Removes the temporary files of path ("<path>.XXXXXX") that writers killed before their
+// rename left behind; those of living writers stay.  errno is kept.
+void SweepReplacements(const char *path);
+// mkstemp on *tmpl ("<path>.XXXXXX", rewritten with the name made) that keeps an
+// exclusive flock on the file for as long as the descriptor is open, so that sweepers
+// leave it alone.  The descriptor, or -1 with errno set.
+int MakeReplacement(std::string *tmpl);
+
 // ---- What may be written into a file ----
 // A section name: not empty, no "]" and no line break.
 bool IsValidSectionName(const char *name);

@@ -80,13 +80,19 @@ ORLO_EXPORT int OLIBCFileLockTimeByFile(const char *lockPath, int exclusive, int
     for (;;) {
         int fd = OpenLockFile(lockPath);
         if (fd < 0) {
-            OLIBCErrSet(orlo::olibc::CodeOfErrno(errno, OLIBC_ERR_FOPEN));
+            int saved = errno;  // ELOOP for a symbolic link, EISDIR for a directory
+            OLIBCErrSet(orlo::olibc::CodeOfErrno(saved, OLIBC_ERR_FOPEN));
+            errno = saved;
             return 0;
         }
         struct stat held;
-        if (fstat(fd, &held) != 0 || !S_ISREG(held.st_mode)) {
+        const bool statted = fstat(fd, &held) == 0;
+        if (!statted || !S_ISREG(held.st_mode)) {
+            // A FIFO or a device where the lock file belongs: never locked through.
+            int saved = statted ? EINVAL : errno;
             close(fd);
             OLIBCErrSet(OLIBC_ERR_FOPEN);
+            errno = saved;
             return 0;
         }
         int rc = Acquire(fd, exclusive, timeoutSec, deadline);

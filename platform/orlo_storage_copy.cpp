@@ -14,6 +14,7 @@
 #include "olibc.h"
 #include "orlo_storage.h"
 #include "platform/orlo_storage_internal.h"
+#include "platform/olibc_file_internal.h"
 #include "platform/os_seam.h"
 
 namespace {
@@ -118,7 +119,10 @@ ORLO_EXPORT int ORLOFileCopy(const char *src, const char *dst) {
         ORLO_STORAGE_FAIL(ENAMETOOLONG, OLIBC_ERR_TOO_LONG);
         return -1;
     }
-    int out = orlo::os::Mkstemp(tmp);
+    orlo::olibc::SweepReplacements(dst);
+    std::string tmpName(tmp);
+    int out = orlo::olibc::MakeReplacement(&tmpName);
+    if (out >= 0) memcpy(tmp, tmpName.c_str(), tmpName.size() + 1);
     if (out < 0) {
         int err = errno;
         ::close(in);

@@ -94,7 +94,7 @@ uint32_t VolumesWithTrash(std::vector<std::string> *volumes) {
 uint32_t RecordGroup(pid_t pgid) {
     orlo::FileLockGuard lock(unmap::kPidLock, true, unmap::kPidLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", unmap::kPidLock);
+        ORLO_LOG_LOCK_FAILED(unmap::kPidLock);
         return ORLO_ERR_LOCK_FILE;
     }
     std::vector<pid_t> groups, kept;

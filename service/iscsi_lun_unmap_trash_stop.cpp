@@ -55,7 +55,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSILunUnmapTrashStop(void) {
     if (orlo::os::Access(unmap::kPidFile, F_OK) != 0 && errno == ENOENT) return ORLO_OK;
     orlo::FileLockGuard lock(unmap::kPidLock, true, unmap::kPidLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", unmap::kPidLock);
+        ORLO_LOG_LOCK_FAILED(unmap::kPidLock);
         return ORLO_ERR_LOCK_FILE;
     }
     std::vector<pid_t> groups;

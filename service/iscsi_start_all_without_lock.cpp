@@ -10,6 +10,7 @@
 #include <cstring>
 
 #include "base/iscsi_base_internal.h"
+#include "lun/lun_internal.h"
 #include "orloiscsi_conf.h"
 #include "orloiscsi_ep.h"
 #include "orloiscsi_service.h"
@@ -63,6 +64,8 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSIStartAllWithoutLock(void) {
         ORLO_LOG_ERR("ORLOiSCSIStartBasicWithoutLock() failed, err=%s", ORLOiSCSIErrStr(ret));
         return ORLO_ERR_INSMOD;
     }
+    // LUNs a killed creation or deletion left half-done are settled before any is loaded.
+    orlo::lun::RecoverPending(false);
     ret = ORLOiSCSILunServiceStartAllWithoutLock();
     if (ret != ORLO_OK) {
         ORLO_LOG_ERR("ORLOiSCSILunServiceStartAllWithoutLock() failed, err=%s", ORLOiSCSIErrStr(ret));

@@ -74,7 +74,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSILunFamilyConfRemove(int32_t lid) {
     }
     orlo::FileLockGuard lock(kFamilyLockPath, true, kLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", kFamilyLockPath);
+        ORLO_LOG_LOCK_FAILED(kFamilyLockPath);
         return ORLO_ERR_LOCK_FILE;
     }
     orlo::SzListGuard doomed(OLIBCSzListAlloc(16));

@@ -30,7 +30,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSILunMappingRemove(int32_t lid) {
     }
     orlo::FileLockGuard lock(kMappingLockPath, true, kLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", kMappingLockPath);
+        ORLO_LOG_LOCK_FAILED(kMappingLockPath);
         return ORLO_ERR_LOCK_FILE;
     }
     POLIBC_SZLIST names = nullptr;

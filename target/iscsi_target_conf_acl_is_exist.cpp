@@ -16,7 +16,7 @@ extern "C" ORLO_EXPORT bool ORLOiSCSITargetConfAclIsExist(int32_t tid, const cha
     if (n < 0 || n >= static_cast<int>(sizeof(section))) return false;
     orlo::FileLockGuard lock(kAclLockPath, false, kLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", kAclLockPath);
+        ORLO_LOG_LOCK_FAILED(kAclLockPath);
         return false;
     }
     if (OLIBCFileExist(kAclConfPath) != 1) return false;

@@ -139,7 +139,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetConfAclLoad(int32_t tid, ORLOiSCS
     if (!ORLOiSCSIListIsInit(list)) ORLOiSCSIListInit(list);
     orlo::FileLockGuard lock(kAclLockPath, false, kLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", kAclLockPath);
+        ORLO_LOG_LOCK_FAILED(kAclLockPath);
         return ORLO_ERR_LOCK_FILE;
     }
     uint32_t ret = LoadEntries(tid, list);

@@ -19,7 +19,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetConfAclRemove(int32_t tid, const 
     }
     orlo::FileLockGuard lock(kAclLockPath, true, kLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", kAclLockPath);
+        ORLO_LOG_LOCK_FAILED(kAclLockPath);
         return ORLO_ERR_LOCK_FILE;
     }
     if (OLIBCFileExist(kAclConfPath) != 1) return ORLO_OK;

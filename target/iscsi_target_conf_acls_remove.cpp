@@ -7,7 +7,7 @@ using namespace orlo::target;
 extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetConfAclsRemove(int32_t tid) {
     orlo::FileLockGuard lock(kAclLockPath, true, kLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", kAclLockPath);
+        ORLO_LOG_LOCK_FAILED(kAclLockPath);
         return ORLO_ERR_LOCK_FILE;
     }
     POLIBC_SZLIST names = nullptr;

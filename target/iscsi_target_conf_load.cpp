@@ -133,7 +133,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetConfLoad(const ORLOiSCSITargetFil
     if (!ORLOiSCSIListIsInit(list)) ORLOiSCSIListInit(list);
     orlo::FileLockGuard lock(kLockPath, false, kLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", kLockPath);
+        ORLO_LOG_LOCK_FAILED(kLockPath);
         return ORLO_ERR_LOCK_FILE;
     }
     uint32_t ret = Load(filter, list);

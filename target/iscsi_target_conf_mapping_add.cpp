@@ -16,7 +16,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetConfMappingAdd(int32_t tid, int32
     }
     orlo::FileLockGuard lock(kMappingLockPath, true, kLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", kMappingLockPath);
+        ORLO_LOG_LOCK_FAILED(kMappingLockPath);
         return ORLO_ERR_LOCK_FILE;
     }
     orlo::SzHashGuard hash(OLIBCSzHashAlloc(kHashSize));

@@ -172,7 +172,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetConfMappingLoad(const ORLOiSCSILu
     if (!ORLOiSCSIListIsInit(&conf->mappings)) ORLOiSCSIListInit(&conf->mappings);
     orlo::FileLockGuard lock(kMappingLockPath, false, kLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", kMappingLockPath);
+        ORLO_LOG_LOCK_FAILED(kMappingLockPath);
         return ORLO_ERR_LOCK_FILE;
     }
     uint32_t ret = LoadSections(filter, &conf->mappings);

@@ -14,7 +14,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetConfMappingRemove(int32_t tid, in
     }
     orlo::FileLockGuard lock(kMappingLockPath, true, kLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", kMappingLockPath);
+        ORLO_LOG_LOCK_FAILED(kMappingLockPath);
         return ORLO_ERR_LOCK_FILE;
     }
     if (OLIBCFileExist(kMappingConfPath) != 1) return ORLO_OK;

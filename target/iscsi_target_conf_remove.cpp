@@ -14,7 +14,7 @@ extern "C" ORLO_EXPORT int ORLOiSCSITargetConfRemove(const ORLOiSCSITarget *targ
     }
     orlo::FileLockGuard lock(kLockPath, true, kLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", kLockPath);
+        ORLO_LOG_LOCK_FAILED(kLockPath);
         return -1;
     }
     char section[kSectionNameSize];

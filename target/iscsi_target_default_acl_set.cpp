@@ -3,6 +3,7 @@
 // older target core the default entry is also a node access list of its own with its LUN
 // entries, which are brought into line too.
 #include "base/iscsi_base_internal.h"
+#include "target/target_life_util.h"
 #include "orloiscsi_target.h"
 #include "target/lio_acl_util.h"
 #include "target/masking_util.h"
@@ -12,6 +13,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetDefaultAclSet(const ORLOiSCSITarg
         ORLO_LOG_BAD_PARAMS();
         return ORLO_ERR_NULL_POINTER;
     }
+    ORLO_TARGET_LOCK_OR_RETURN(targetLock, ORLO_ERR_LOCK_FILE);
     uint32_t ret = ORLOiSCSITargetConfAclAdd(target->tid, ORLO_ISCSI_DEFAULT_ACL_INITIATOR, authority);
     if (ret != ORLO_OK) {
         ORLO_LOG_ERR("ORLOiSCSITargetConfAclAdd(%d, \"%s\", %d) failed, err=%s", target->tid,

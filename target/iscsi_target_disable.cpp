@@ -9,6 +9,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetDisable(ORLOiSCSITarget *target) 
         ORLO_LOG_BAD_PARAMS();
         return ORLO_ERR_NULL_POINTER;
     }
+    ORLO_TARGET_LOCK_OR_RETURN(targetLock, ORLO_ERR_LOCK_FILE);
     uint32_t ret = ORLOiSCSITargetUnload(target);
     if (ret != ORLO_OK) {
         ORLO_LOG_ERR("ORLOiSCSITargetUnload(%p) failed, err=%s", static_cast<void *>(target), ORLOiSCSIErrStr(ret));

@@ -11,6 +11,7 @@ extern "C" ORLO_EXPORT int ORLOiSCSITargetDisableByLid(int32_t *state, int32_t l
         ORLO_LOG_BAD_PARAMS();
         return -1;
     }
+    ORLO_TARGET_LOCK_OR_RETURN(targetLock, -1);
     life::ConfScope conf;
     uint32_t ret = life::QueryConf(life::kQueryTargetsOfLun, 0, lid, conf.get());
     if (ret != ORLO_OK) {

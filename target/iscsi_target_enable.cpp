@@ -9,6 +9,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetEnable(ORLOiSCSITarget *target) {
         ORLO_LOG_BAD_PARAMS();
         return ORLO_ERR_NULL_POINTER;
     }
+    ORLO_TARGET_LOCK_OR_RETURN(targetLock, ORLO_ERR_LOCK_FILE);
     ORLOiSCSIAclList acls = {};
     ORLOiSCSIListInit(&acls);
     auto freeAcls = orlo::MakeScopeExit([&acls] { ORLOiSCSITargetAclListFree(&acls); });

@@ -10,6 +10,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetEnableByLid(int32_t *state, int32
         ORLO_LOG_BAD_PARAMS();
         return ORLO_ERR_BAD_PARAMETER;
     }
+    ORLO_TARGET_LOCK_OR_RETURN(targetLock, ORLO_ERR_LOCK_FILE);
     life::ConfScope conf;
     ORLOiSCSILunFilter filter = {};
     filter.flags = life::kQueryTargetsOfLun;

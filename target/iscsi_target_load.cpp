@@ -8,6 +8,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetLoad(ORLOiSCSITarget *target) {
         ORLO_LOG_BAD_PARAMS();
         return ORLO_ERR_NULL_POINTER;
     }
+    ORLO_TARGET_LOCK_OR_RETURN(targetLock, ORLO_ERR_LOCK_FILE);
     // iSNS is best effort: a target loads whether or not the server can be reached.
     if (!ORLOiSCSIiSNSIsConnected()) (void)ORLOiSCSIiSNSConnect();
     uint32_t ret = ORLOiSCSILioTargetLoad(target, false);

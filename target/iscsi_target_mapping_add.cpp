@@ -5,13 +5,45 @@
 #include "base/iscsi_base_internal.h"
 #include "target/target_life_util.h"
 
+namespace {
+
+// The number the LUN has in the target, or -1 when it is not mapped there.
+uint32_t MappedNumber(int32_t tid, int32_t lid, int32_t *number) {
+    namespace life = orlo::target::life;
+    life::ConfScope conf;
+    uint32_t ret = life::QueryConf(life::kQueryOneMapping, tid, lid, conf.get());
+    if (ret != ORLO_OK) {
+        ORLO_LOG_ERR("ORLOiSCSIConfGet(0x%X, tid:%d lid:%d) failed, err=%s", life::kQueryOneMapping, tid, lid,
+                     ORLOiSCSIErrStr(ret));
+        return life::kErrGetConfig;
+    }
+    *number = -1;
+    ORLOiSCSIListLink *link;
+    ORLOiSCSIMapping *m;
+    ORLO_ISCSI_MAPPING_LIST_FOREACH(&conf->mappings, link, m) {
+        if (m->tid == tid && m->lid == lid) *number = m->lun;
+    }
+    return ORLO_OK;
+}
+
+}  // namespace
+
 extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetMappingAdd(int32_t tid, int32_t lid, int32_t lun) {
     namespace life = orlo::target::life;
     if (!life::TidValid(tid) || !life::LidValid(lid)) {
         ORLO_LOG_BAD_PARAMS();
         return ORLO_ERR_BAD_PARAMETER;
     }
+    ORLO_TARGET_LOCK_OR_RETURN(targetLock, ORLO_ERR_LOCK_FILE);
     uint32_t ret;
+    // Mapped already: one LUN has one number in a target.  Mapping it again would put a
+    // second LUN entry into the kernel while the file keeps only one.
+    int32_t already = -1;
+    if ((ret = MappedNumber(tid, lid, &already)) != ORLO_OK) return ret;
+    if (already >= 0) {
+        ORLO_LOG_ERR("Failed to map lid:%d to tid:%d, mapped already as LUN %d", lid, tid, already);
+        return life::kErrLunMapped;
+    }
     if (lun <= ORLO_ISCSI_MAPPING_LUN_MAX) {
         bool used = false;
         if ((ret = ORLOiSCSITargetIsLunMapped(tid, lun, &used)) != ORLO_OK) {

@@ -8,6 +8,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetMappingRemove(int32_t tid, int32_
         ORLO_LOG_BAD_PARAMS();
         return ORLO_ERR_BAD_PARAMETER;
     }
+    ORLO_TARGET_LOCK_OR_RETURN(targetLock, ORLO_ERR_LOCK_FILE);
     uint32_t ret = ORLOiSCSITargetMappingUnload(tid, lid, nullptr);
     if (ret != ORLO_OK) {
         ORLO_LOG_ERR("ORLOiSCSITargetMappingUnload(%d, %d, NULL) failed, err=%s", tid, lid, ORLOiSCSIErrStr(ret));

@@ -53,6 +53,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetMappingUnload(int32_t tid, int32_
         ORLO_LOG_BAD_PARAMS();
         return ORLO_ERR_BAD_PARAMETER;
     }
+    ORLO_TARGET_LOCK_OR_RETURN(targetLock, ORLO_ERR_LOCK_FILE);
     life::ConfScope queried;
     const ORLOiSCSIConf *conf = given;
     if (conf == nullptr) {

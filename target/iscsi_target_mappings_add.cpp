@@ -75,6 +75,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetMappingsAdd(int32_t tid, const in
             return ORLO_ERR_BAD_PARAMETER;
         }
     }
+    ORLO_TARGET_LOCK_OR_RETURN(targetLock, ORLO_ERR_LOCK_FILE);
 
     // The target with its mappings; a target without any is looked up alone.
     life::ConfScope mapped;

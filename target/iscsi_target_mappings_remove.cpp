@@ -27,6 +27,7 @@ extern "C" ORLO_EXPORT int ORLOiSCSITargetMappingsRemove(int32_t tid, const int3
             return -1;
         }
     }
+    ORLO_TARGET_LOCK_OR_RETURN(targetLock, -1);
     life::ConfScope conf;
     if (life::QueryConfLids(life::kQueryMappingsOfLids, tid, lids, count, conf.get()) != ORLO_OK) {
         ORLO_LOG_ERR("Failed to get config");

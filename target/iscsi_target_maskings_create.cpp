@@ -5,6 +5,7 @@
 // the kernel cannot follow, the new entries are taken out of the file and the kernel
 // again, so the call changes nothing.
 #include "base/iscsi_base_internal.h"
+#include "target/target_life_util.h"
 #include "orloiscsi_target.h"
 #include "target/masking_util.h"
 
@@ -13,6 +14,7 @@ constexpr uint32_t kErrCreateMasking = 18990715;
 }  // namespace
 
 ORLO_EXPORT uint32_t ORLOiSCSITargetMaskingsCreate(const std::vector<ORLOiSCSIAcl> &records) {
+    ORLO_TARGET_LOCK_OR_RETURN(targetLock, ORLO_ERR_LOCK_FILE);
     namespace masking = orlo::target::masking;
     ORLOiSCSITarget target;
     if (!masking::CheckRequest(records, true, &target)) return kErrCreateMasking;

@@ -4,6 +4,7 @@
 // initiator without an entry is already removed.  When the kernel cannot follow, the
 // entries are stored again and applied, so the call changes nothing.
 #include "base/iscsi_base_internal.h"
+#include "target/target_life_util.h"
 #include "orloiscsi_target.h"
 #include "target/masking_util.h"
 
@@ -12,6 +13,7 @@ constexpr uint32_t kErrRemoveMasking = 18990716;
 }  // namespace
 
 ORLO_EXPORT uint32_t ORLOiSCSITargetMaskingsRemove(const std::vector<ORLOiSCSIAcl> &records) {
+    ORLO_TARGET_LOCK_OR_RETURN(targetLock, ORLO_ERR_LOCK_FILE);
     namespace masking = orlo::target::masking;
     ORLOiSCSITarget target;
     // The authority a removal carries is not looked at.

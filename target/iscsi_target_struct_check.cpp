@@ -28,6 +28,7 @@ uint32_t CheckRecord(const ORLOiSCSITarget *t, bool checkAuthType) {
     }
     const char *fault = ValueFault(t->name, sizeof(t->name));
     if (fault == nullptr && t->name[0] == '\0') fault = "empty";
+    if (fault == nullptr && !IsUtf8(t->name, strlen(t->name))) fault = "not UTF-8";
     if (fault != nullptr) {
         ORLO_LOG_ERR("Bad target name of tid %d: %s", t->tid, fault);
         return kErrBadName;

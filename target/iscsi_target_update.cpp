@@ -1,8 +1,14 @@
 // Changes a target: the stored target of the record's tid is taken out of the kernel,
 // the record replaces its section, and the target comes back when the record is
 // enabled.  An update always restarts a running target; nothing is rolled back.  An
-// unknown tid is reported as success and changes nothing.
+// unknown tid is reported as success and changes nothing.  A new name or IQN that
+// another target has is refused (18990700, 18990701) before anything changes.
+#include <strings.h>
+
+#include <cstring>
+
 #include "base/iscsi_base_internal.h"
+#include "target/target_internal.h"
 #include "target/target_life_util.h"
 
 extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetUpdate(ORLOiSCSITarget *target) {
@@ -11,6 +17,7 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetUpdate(ORLOiSCSITarget *target) {
         ORLO_LOG_BAD_PARAMS();
         return ORLO_ERR_NULL_POINTER;
     }
+    ORLO_TARGET_LOCK_OR_RETURN(targetLock, ORLO_ERR_LOCK_FILE);
     life::ConfScope conf;
     uint32_t ret = life::QueryConf(life::kQueryTarget, target->tid, 0, conf.get());
     if (ret != ORLO_OK) {
@@ -23,6 +30,10 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetUpdate(ORLOiSCSITarget *target) {
         ORLO_LOG_ERR("Failed to zero target_cnt %d, pOrgTrg 0x%p", conf->targets.count, static_cast<void *>(stored));
         return ORLO_OK;
     }
+    // A new name or IQN must be free, checked before anything changes.
+    if ((strcmp(stored->name, target->name) != 0 || strcasecmp(stored->iqn, target->iqn) != 0) &&
+        (ret = orlo::target::CheckIdentityFree(target)) != ORLO_OK)
+        return ret;
     if (life::InKernel(stored)) {
         if ((ret = ORLOiSCSITargetUnload(stored)) != ORLO_OK) {
             ORLO_LOG_ERR("ORLOiSCSITargetUnload(%p) failed, err=%s", static_cast<void *>(stored),

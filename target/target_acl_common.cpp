@@ -50,7 +50,7 @@ uint32_t WriteAclSection(int32_t tid, const char *initiator, int32_t authority, 
     if (ret != ORLO_OK) return ret;
     FileLockGuard lock(kAclLockPath, true, kLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", kAclLockPath);
+        ORLO_LOG_LOCK_FAILED(kAclLockPath);
         return ORLO_ERR_LOCK_FILE;
     }
     SzHashGuard hash(OLIBCSzHashAlloc(kHashSize));

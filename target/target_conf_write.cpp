@@ -75,7 +75,7 @@ uint32_t WriteTargetSection(const ORLOiSCSITarget *t, bool update) {
     }
     FileLockGuard lock(kLockPath, true, kLockTimeoutSec);
     if (!lock.held()) {
-        ORLO_LOG_ERR("Failed to lock file: %s.", kLockPath);
+        ORLO_LOG_LOCK_FAILED(kLockPath);
         return ORLO_ERR_LOCK_FILE;
     }
     SzHashGuard hash(OLIBCSzHashAlloc(kHashSize));

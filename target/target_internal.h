@@ -52,6 +52,10 @@ const char *ValueFault(const char *value, size_t size);
 // says whether an auth_type outside 0..2 is refused.
 uint32_t CheckRecord(const ORLOiSCSITarget *target, bool checkAuthType);
 
+// 18990700 when another tid has the record's name, 18990701 when another has its IQN
+// (logged); 0 when both are free.  The caller holds the target lock.
+uint32_t CheckIdentityFree(const ORLOiSCSITarget *target);
+
 // The upsert of one target section (Add with update false, Update with update true).
 uint32_t WriteTargetSection(const ORLOiSCSITarget *target, bool update);
 

@@ -6,6 +6,7 @@
 
 #include <cstdint>
 
+#include "base/iscsi_base_internal.h"
 #include "orloiscsi_conf.h"
 #include "orloiscsi_target.h"
 
@@ -69,6 +70,15 @@ ORLOiSCSITarget *TargetOfTid(const ORLOiSCSIConf &conf, int32_t tid);
 
 // Whether the target's node is in the kernel (status bit 0 or 1).
 bool InKernel(const ORLOiSCSITarget *target);
+
+// Takes the target lock (re-entrant: an operation that calls another holds it once) for
+// the rest of the scope; when it cannot be taken, logs why and returns failret.
+#define ORLO_TARGET_LOCK_OR_RETURN(guard, failret)                                            \
+    orlo::ReentrantLockGuard guard(orlo::kTargetLockPath, orlo::kTargetLockTimeoutSec);      \
+    if (!guard.held()) {                                                                       \
+        ORLO_LOG_LOCK_FAILED(orlo::kTargetLockPath);                                           \
+        return failret;                                                                        \
+    }
 
 // Valid identifiers.
 inline bool TidValid(int32_t tid) { return tid >= ORLO_ISCSI_TID_MIN && tid <= ORLO_ISCSI_TID_MAX; }

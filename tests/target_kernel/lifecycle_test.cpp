@@ -68,6 +68,8 @@ TEST_F(LifecycleTest, CreateStoresFirstAndKeepsTheSectionWhenTheKernelLoadFails)
 
     // Enabled, and the kernel refuses the node: 18990722, the section stays as asked.
     ORLOiSCSITarget failing = target_test::MakeTarget(0);
+    snprintf(failing.name, sizeof(failing.name), "failing");
+    snprintf(failing.iqn, sizeof(failing.iqn), "iqn.2000-01.com.orlo-nas:store.failing");
     failing.enabled = true;
     ASSERT_EQ(0, SetFault("mkdir", std::string("/target/iscsi/") + failing.iqn, "EIO"));
     log_.Clear();
@@ -79,6 +81,7 @@ TEST_F(LifecycleTest, CreateStoresFirstAndKeepsTheSectionWhenTheKernelLoadFails)
 
     // Enabled and loadable: the node is built and takes logins.
     ORLOiSCSITarget loaded = target_test::MakeTarget(0);
+    snprintf(loaded.name, sizeof(loaded.name), "loaded");
     snprintf(loaded.iqn, sizeof(loaded.iqn), "iqn.2000-01.com.orlo-nas:store.loaded");
     loaded.enabled = true;
     ASSERT_EQ(0u, ORLOiSCSITargetCreate(&loaded)) << log_.Dump();
@@ -86,7 +89,22 @@ TEST_F(LifecycleTest, CreateStoresFirstAndKeepsTheSectionWhenTheKernelLoadFails)
     EXPECT_EQ(3, Status(loaded));
 
     // A record the file refuses gets no tid's section; null is refused at once.
+    // A name or an IQN another target has is refused before anything is written (the
+    // IQN compared without case); the free tid stays free.
+    const std::string stored = ReadFile(target_test::kTargetConf);
+    ORLOiSCSITarget twin = target_test::MakeTarget(0);
+    snprintf(twin.name, sizeof(twin.name), "loaded");
+    snprintf(twin.iqn, sizeof(twin.iqn), "iqn.2000-01.com.orlo-nas:store.twin");
+    log_.Clear();
+    EXPECT_EQ(18990700u, ORLOiSCSITargetCreate(&twin));
+    EXPECT_TRUE(log_.Contains("Target name is used by tid 3 already: loaded")) << log_.Dump();
+    snprintf(twin.name, sizeof(twin.name), "twin");
+    snprintf(twin.iqn, sizeof(twin.iqn), "iqn.2000-01.com.orlo-nas:STORE.loaded");
+    EXPECT_EQ(18990701u, ORLOiSCSITargetCreate(&twin));
+    EXPECT_EQ(stored, ReadFile(target_test::kTargetConf));
+
     ORLOiSCSITarget bad = target_test::MakeTarget(0);
+    snprintf(bad.name, sizeof(bad.name), "bad");
     snprintf(bad.iqn, sizeof(bad.iqn), "not an iqn");
     log_.Clear();
     EXPECT_EQ(18990725u, ORLOiSCSITargetCreate(&bad));

@@ -15,6 +15,7 @@
 #include "olibc.h"
 #include "orloiscsi_base.h"
 #include "orloiscsi_lun.h"
+#include "platform/os_seam.h"
 
 namespace cli {
 
@@ -195,24 +196,23 @@ void DrawBar(unsigned long long total, unsigned long long done) {
             HumanSize(done).c_str(), HumanSize(total).c_str());
 }
 
-// Shows the growth of the LUN's data file while creation runs on another thread, and
-// where it ended.  Nothing is shown for a LUN that needs no growing (thin, advanced).
-void ShowProgress(const std::atomic<bool> &finished) {
+// Shows the growth of the LUN's data file while creation runs on another thread.  The
+// creation removes its progress file when it ends, so the last plan seen is returned for
+// the final bar.  Nothing is shown for a LUN that needs no growing (thin, advanced).
+bool ShowProgress(const std::atomic<bool> &finished, unsigned long long *lastTotal) {
     unsigned long long total = 0, done = 0, lastDone = ~0ULL;
     bool shown = false;
+    *lastTotal = 0;
     while (!finished.load()) {
         if (ReadProgress(&total, &done) && done != lastDone) {
             DrawBar(total, done);
             lastDone = done;
+            *lastTotal = total;
             shown = true;
         }
         usleep(100 * 1000);
     }
-    if (ReadProgress(&total, &done)) {
-        DrawBar(total, done);
-        shown = true;
-    }
-    if (shown) fprintf(stderr, "\n");
+    return shown;
 }
 
 int RunCreate(const Context &ctx, const Args &args) {
@@ -267,8 +267,17 @@ int RunCreate(const Context &ctx, const Args &args) {
         ret = ORLOiSCSILunCreate(&lun);
         done.store(true);
     });
-    if (showProgress) ShowProgress(done);
+    unsigned long long planned = 0;
+    bool shown = showProgress && ShowProgress(done, &planned);
     worker.join();
+    if (showProgress) orlo::os::Unlink(ProgressPath().c_str());  // ours, when the creation did not get to it
+    // A thick file LUN's data file was grown even when it was over before the first look.
+    const bool thick = ORLO_ISCSI_LUN_IS_FILE_BACKED(lun.type) && !ORLO_ISCSI_LUN_TYPE_HAS(lun.type, ORLO_ISCSI_LUN_BIT_THIN);
+    if (showProgress && ret == ORLO_OK && planned == 0 && thick) planned = lun.size;
+    if (shown || (showProgress && ret == ORLO_OK && planned > 0)) {
+        if (ret == ORLO_OK && planned > 0) DrawBar(planned, planned);
+        fprintf(stderr, "\n");
+    }
     if (ret != ORLO_OK) return Fail(ret);
     if (ctx.json) {
         PrintLunJson(lun, -1, -1);
