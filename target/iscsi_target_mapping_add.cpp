@@ -7,9 +7,19 @@
 
 namespace {
 
+constexpr const char kMappingLockPath[] = "/tmp/iscsi/iscsi_mapping.conf.lock";
+constexpr int kMappingLockTimeoutSec = 60;
+
 // The number the LUN has in the target, or -1 when it is not mapped there.
 uint32_t MappedNumber(int32_t tid, int32_t lid, int32_t *number) {
     namespace life = orlo::target::life;
+    // Read under the mapping file's lock, so that a lock file that cannot be taken is
+    // reported as such rather than as a failed query.
+    orlo::FileLockGuard lock(kMappingLockPath, false, kMappingLockTimeoutSec);
+    if (!lock.held()) {
+        ORLO_LOG_LOCK_FAILED(kMappingLockPath);
+        return ORLO_ERR_LOCK_FILE;
+    }
     life::ConfScope conf;
     uint32_t ret = life::QueryConf(life::kQueryOneMapping, tid, lid, conf.get());
     if (ret != ORLO_OK) {
@@ -92,6 +102,10 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetMappingAdd(int32_t tid, int32_t l
         if ((ret = ORLOiSCSITargetConfAclLoad(tid, &acls)) != ORLO_OK) {
             ORLO_LOG_ERR("ORLOiSCSITargetConfAclLoad(%d, %p) failed, err=%s", tid, static_cast<void *>(&acls),
                          ORLOiSCSIErrStr(ret));
+            return ret;
+        }
+        if ((ret = life::ClearUnnamedLunEntry(target, lun)) != ORLO_OK) {
+            ORLO_LOG_ERR("Failed to clear LUN entry lun_%d of tid:%d, err=%s", lun, tid, ORLOiSCSIErrStr(ret));
             return ret;
         }
         if ((ret = ORLOiSCSILioMappingAdd(target, lunRecord, lun, &acls)) != ORLO_OK) {

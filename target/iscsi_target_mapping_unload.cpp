@@ -15,27 +15,6 @@ namespace {
 namespace life = orlo::target::life;
 namespace acl = orlo::target::acl;
 
-// Removes the LUN entry n of every node access list of the target's portal group.
-uint32_t ORLOiSCSILioTargetLunACLInitiatorsRemove(const char *iqn, int tpgt, int n) {
-    char acls[acl::kPathSize];
-    uint32_t ret = acl::FormatPath(acls, "/config/target/iscsi/%s/tpgt_%d/acls", iqn, tpgt);
-    if (ret != ORLO_OK) return ret;
-    std::vector<std::string> initiators;
-    if ((ret = orlo::target::ListConfigfsDir(acls, &initiators)) != ORLO_OK) return ret;
-    for (const std::string &initiator : initiators) {
-        if ((ret = ORLOiSCSILioTargetLunAclInitiatorRemove(iqn, tpgt, initiator.c_str(), n)) != ORLO_OK) return ret;
-    }
-    return ORLO_OK;
-}
-
-// Removes the portal group's LUN entry n: its backstore link, then the entry.
-uint32_t ORLOiSCSILioMappingUnlink(const ORLOiSCSITarget *target, int n) {
-    char lun[acl::kPathSize];
-    uint32_t ret = acl::FormatPath(lun, acl::kTpgLunFmt, target->iqn, ISCSI_TARGET_DEFAULT_TPGT_NUMBER, n);
-    if (ret != ORLO_OK) return ret;
-    return ORLOiSCSITargetPortalGroupLunRemoveEntry(lun);
-}
-
 const ORLOiSCSIMapping *FindMapping(const ORLOiSCSIConf &conf, int32_t tid, int32_t lid) {
     if (!ORLOiSCSIListIsInit(&conf.mappings)) return nullptr;
     ORLOiSCSIListLink *link;
@@ -75,14 +54,14 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetMappingUnload(int32_t tid, int32_
         return life::kErrLoadTargetConfig;
     }
     const ORLOiSCSITarget *target = mapping->pTrg;
-    uint32_t ret = ORLOiSCSILioTargetLunACLInitiatorsRemove(target->iqn, ISCSI_TARGET_DEFAULT_TPGT_NUMBER, mapping->lun);
+    uint32_t ret = life::LunAclInitiatorsRemove(target->iqn, ISCSI_TARGET_DEFAULT_TPGT_NUMBER, mapping->lun);
     if (ret != ORLO_OK) {
         ORLO_LOG_ERR("ORLOiSCSILioTargetLunACLInitiatorsRemove(\"%s\", ISCSI_TARGET_DEFAULT_TPGT_NUMBER, %d) failed, "
                      "err=%s",
                      target->iqn, mapping->lun, ORLOiSCSIErrStr(ret));
         return ret;
     }
-    if ((ret = ORLOiSCSILioMappingUnlink(target, mapping->lun)) != ORLO_OK) {
+    if ((ret = life::LunEntryUnlink(target, mapping->lun)) != ORLO_OK) {
         ORLO_LOG_ERR("ORLOiSCSILioMappingUnlink(%p, %d) failed, err=%s", static_cast<const void *>(target),
                      mapping->lun, ORLOiSCSIErrStr(ret));
         return life::kErrRemoveMapping;

@@ -138,6 +138,10 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetMappingsAdd(int32_t tid, const in
             ORLO_LOG_ERR("Failed to mapped lid:%d into tid:%d with INVALID lun:%d", lid, tid, n);
             return life::kErrGetLunId;
         }
+        if (inKernel && (ret = life::ClearUnnamedLunEntry(target, n)) != ORLO_OK) {
+            ORLO_LOG_ERR("Failed to clear LUN entry lun_%d of tid:%d, err=%s", n, tid, ORLOiSCSIErrStr(ret));
+            return ret;
+        }
         if (inKernel && (ret = ORLOiSCSILioMappingAdd(target, LunOfLid(*all, lid), n, &acls)) != ORLO_OK) {
             ORLO_LOG_ERR("Failed to Map lid:%d to tid:%d As lun:%d", lid, tid, n);
             return ret;

@@ -1,4 +1,10 @@
-// Snapshot queries and look-ups shared by the mapping and life-cycle functions.
+// Snapshot queries and look-ups shared by the mapping and life-cycle functions, and the
+// removal of one LUN entry from a portal group.
+#include <string>
+#include <vector>
+
+#include "target/iscsi_lio_unload_util.h"
+#include "target/lio_acl_util.h"
 #include "target/target_life_util.h"
 
 namespace orlo {
@@ -45,6 +51,40 @@ ORLOiSCSITarget *TargetOfTid(const ORLOiSCSIConf &conf, int32_t tid) {
 bool InKernel(const ORLOiSCSITarget *target) {
     return (ORLOiSCSITargetStatusGet(target->tid, target) &
             (ORLO_ISCSI_TARGET_STATUS_PRESENT | ORLO_ISCSI_TARGET_STATUS_ENABLED)) != 0;
+}
+
+uint32_t LunAclInitiatorsRemove(const char *iqn, int tpgt, int n) {
+    namespace acl = orlo::target::acl;
+    char acls[acl::kPathSize];
+    uint32_t ret = acl::FormatPath(acls, "/config/target/iscsi/%s/tpgt_%d/acls", iqn, tpgt);
+    if (ret != ORLO_OK) return ret;
+    std::vector<std::string> initiators;
+    if ((ret = orlo::target::ListConfigfsDir(acls, &initiators)) != ORLO_OK) return ret;
+    for (const std::string &initiator : initiators) {
+        if ((ret = ORLOiSCSILioTargetLunAclInitiatorRemove(iqn, tpgt, initiator.c_str(), n)) != ORLO_OK) return ret;
+    }
+    return ORLO_OK;
+}
+
+uint32_t LunEntryUnlink(const ORLOiSCSITarget *target, int n) {
+    namespace acl = orlo::target::acl;
+    char lun[acl::kPathSize];
+    uint32_t ret = acl::FormatPath(lun, acl::kTpgLunFmt, target->iqn, ISCSI_TARGET_DEFAULT_TPGT_NUMBER, n);
+    if (ret != ORLO_OK) return ret;
+    return ORLOiSCSITargetPortalGroupLunRemoveEntry(lun);
+}
+
+uint32_t ClearUnnamedLunEntry(const ORLOiSCSITarget *target, int n) {
+    ORLOiSCSIMapping probe = {};
+    probe.tid = target->tid;
+    probe.lun = n;
+    bool present = false;
+    uint32_t ret = ORLOiSCSITargetLunIsMapped(&probe, &present);
+    if (ret != ORLO_OK || !present) return ret;
+    ORLO_LOG_ERR("Removing LUN entry lun_%d of target %s that no mapping names (left by an interrupted mapping)", n,
+                 target->iqn);
+    if ((ret = LunAclInitiatorsRemove(target->iqn, ISCSI_TARGET_DEFAULT_TPGT_NUMBER, n)) != ORLO_OK) return ret;
+    return LunEntryUnlink(target, n);
 }
 
 }  // namespace life

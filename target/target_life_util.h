@@ -80,6 +80,16 @@ bool InKernel(const ORLOiSCSITarget *target);
         return failret;                                                                        \
     }
 
+// Removes the LUN entry n of every node access list of the target's portal group.
+uint32_t LunAclInitiatorsRemove(const char *iqn, int tpgt, int n);
+// Removes the portal group's LUN entry n: its backstore link, then the entry.
+uint32_t LunEntryUnlink(const ORLOiSCSITarget *target, int n);
+// Before number n is given to a new mapping of a running target (under the target
+// lock): a LUN entry n that the kernel holds although the file names no mapping with
+// that number was left by a process killed between the kernel step and the file step of
+// a mapping; it is taken out (logged) so that the kernel follows the file.
+uint32_t ClearUnnamedLunEntry(const ORLOiSCSITarget *target, int n);
+
 // Valid identifiers.
 inline bool TidValid(int32_t tid) { return tid >= ORLO_ISCSI_TID_MIN && tid <= ORLO_ISCSI_TID_MAX; }
 inline bool LidValid(int32_t lid) { return lid >= ORLO_ISCSI_LID_MIN && lid <= ORLO_ISCSI_LID_MAX; }
