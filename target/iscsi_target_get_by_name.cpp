@@ -1,4 +1,6 @@
 // One target by name, copied into the caller's record.
+#include <string>
+
 #include "base/iscsi_base_internal.h"
 #include "target/target_internal.h"
 
@@ -10,5 +12,5 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetGetByName(const char *name, uint3
     }
     ORLOiSCSITargetList list = {};
     uint32_t ret = ORLOiSCSITargetConfGetByName(name, extraFlags, &list);
-    return orlo::target::CopyFirst(ret, &list, target);
+    return orlo::target::CopyFirst(ret, &list, target, std::string("name: ") + name);
 }

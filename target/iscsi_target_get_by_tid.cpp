@@ -1,4 +1,6 @@
 // One target by tid, copied into the caller's record.
+#include <string>
+
 #include "base/iscsi_base_internal.h"
 #include "target/target_internal.h"
 
@@ -9,5 +11,5 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSITargetGetByTid(int32_t tid, uint32_t ex
     }
     ORLOiSCSITargetList list = {};
     uint32_t ret = ORLOiSCSITargetConfGetByTid(tid, extraFlags, &list);
-    return orlo::target::CopyFirst(ret, &list, target);
+    return orlo::target::CopyFirst(ret, &list, target, "tid: " + std::to_string(tid));
 }

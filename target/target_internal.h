@@ -4,6 +4,7 @@
 #define ORLO_TARGET_TARGET_INTERNAL_H
 
 #include <cstdint>
+#include <string>
 
 #include "olibc.h"
 #include "orloiscsi_target.h"
@@ -59,8 +60,9 @@ uint32_t CheckIdentityFree(const ORLOiSCSITarget *target);
 // The upsert of one target section (Add with update false, Update with update true).
 uint32_t WriteTargetSection(const ORLOiSCSITarget *target, bool update);
 
-// Copies the first record of a lookup's list (freed here in every case) into out.
-uint32_t CopyFirst(uint32_t loadRet, ORLOiSCSITargetList *list, ORLOiSCSITarget *out);
+// Copies the first record of a lookup's list (freed here in every case) into out; which
+// names what was looked up ("name: web", "tid: 3") in the log line of a failure.
+uint32_t CopyFirst(uint32_t loadRet, ORLOiSCSITargetList *list, ORLOiSCSITarget *out, const std::string &which);
 
 // Splits an access-list section name: true with tid and the initiator's offset.
 bool ScanAclSection(const char *section, int32_t *tid, const char **initiator);
