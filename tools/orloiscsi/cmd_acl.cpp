@@ -17,10 +17,6 @@ namespace {
 
 const uint32_t kErrBadAcl = 18990711;  // Bad target acl
 
-enum ActionIndex { kAdd, kUpdate, kRemove, kList, kDefault };
-
-int UsageOf(ActionIndex i);
-
 // Permission words, as the command line takes them and as it prints them.
 struct Permission {
     const char *word;
@@ -42,22 +38,18 @@ bool ParsePermission(const std::string &s, int32_t *authority) {
     return false;
 }
 
-const char *PermissionWord(int32_t authority) {
-    switch (authority) {
-        case ISCSI_TARGET_AUTHORITY_NONE: return "none";
-        case ISCSI_TARGET_AUTHORITY_RO: return "read-only";
-        case ISCSI_TARGET_AUTHORITY_LEGACY_RW:
-        case ISCSI_TARGET_AUTHORITY_RW: return "read-write";
-        default: return "unknown";
-    }
-}
-
 bool IsDefault(const char *initiator) { return strcmp(initiator, ORLO_ISCSI_DEFAULT_ACL_INITIATOR) == 0; }
 
-// The target of the first positional argument, with its secrets wiped (only its tid,
-// name and kernel state matter here).  0, or the exit status.
-int TargetOf(const ParsedOptions &o, ORLOiSCSITarget *t) {
-    uint32_t ret = FindTarget(o.positional[0], t);
+// The arguments of every acl action (only the chosen action's are filled).
+struct AclArgs {
+    std::string target, initiator, permission;
+    bool ro = false, rw = false, none = false;
+};
+
+// The target named, with its secrets wiped (only its tid, name and kernel state matter
+// here).  0, or the exit status.
+int TargetOf(const std::string &ref, ORLOiSCSITarget *t) {
+    uint32_t ret = FindTarget(ref, t);
     explicit_bzero(t->password, sizeof(t->password));
     explicit_bzero(t->mutual_password, sizeof(t->mutual_password));
     return ret == ORLO_OK ? 0 : Fail(ret);
@@ -76,25 +68,12 @@ int FindEntry(int32_t tid, const std::string &initiator, bool *found) {
 
 // TARGET INITIATOR [--ro|--rw|--none] of add, update and remove, into record.  0, or the
 // exit status.
-int EntryArgs(const Args &args, ActionIndex i, bool wantPermission, ORLOiSCSITarget *t, ORLOiSCSIAcl *record) {
-    const OptionSpec withPermission[] = {{"--ro", false}, {"--rw", false}, {"--none", false}, {nullptr, false}};
-    const OptionSpec without[] = {{nullptr, false}};
-    ParsedOptions o;
-    if (!ParseOptionList(args, wantPermission ? withPermission : without, &o) || o.positional.size() != 2)
-        return UsageOf(i);
+int EntryArgs(const AclArgs &a, bool wantPermission, ORLOiSCSITarget *t, ORLOiSCSIAcl *record) {
     memset(record, 0, sizeof(*record));
     record->authority = ISCSI_TARGET_AUTHORITY_NONE;
-    if (wantPermission) {
-        int given = o.Has("--ro") + o.Has("--rw") + o.Has("--none");
-        if (given != 1) {
-            fprintf(stderr, "orloiscsi: give exactly one of --ro, --rw and --none\n");
-            return UsageOf(i);
-        }
-        record->authority = o.Has("--rw")   ? ISCSI_TARGET_AUTHORITY_RW
-                            : o.Has("--ro") ? ISCSI_TARGET_AUTHORITY_RO
-                                            : ISCSI_TARGET_AUTHORITY_NONE;
-    }
-    const std::string &initiator = o.positional[1];
+    if (wantPermission)
+        record->authority = a.rw ? ISCSI_TARGET_AUTHORITY_RW : a.ro ? ISCSI_TARGET_AUTHORITY_RO : ISCSI_TARGET_AUTHORITY_NONE;
+    const std::string &initiator = a.initiator;
     if (IsDefault(initiator.c_str())) {
         fprintf(stderr, "orloiscsi: the default entry is set with 'acl default TARGET none|read-only|read-write'\n");
         return Fail(kErrBadAcl);
@@ -103,17 +82,17 @@ int EntryArgs(const Args &args, ActionIndex i, bool wantPermission, ORLOiSCSITar
         fprintf(stderr, "orloiscsi: '%s' is not an iSCSI initiator name (iqn., eui. or naa.)\n", initiator.c_str());
         return Fail(kErrBadAcl);
     }
-    int rc = TargetOf(o, t);
+    int rc = TargetOf(a.target, t);
     if (rc != 0) return rc;
     record->tid = t->tid;
     memcpy(record->initiator, initiator.c_str(), initiator.size() + 1);
     return 0;
 }
 
-int RunAdd(const Context &, const Args &args) {
+int RunAdd(const AclArgs &a) {
     ORLOiSCSITarget t;
     ORLOiSCSIAcl record;
-    int rc = EntryArgs(args, kAdd, true, &t, &record);
+    int rc = EntryArgs(a, true, &t, &record);
     if (rc != 0) return rc;
     bool found = false;
     rc = FindEntry(t.tid, record.initiator, &found);
@@ -129,10 +108,10 @@ int RunAdd(const Context &, const Args &args) {
     return 0;
 }
 
-int RunUpdate(const Context &, const Args &args) {
+int RunUpdate(const AclArgs &a) {
     ORLOiSCSITarget t;
     ORLOiSCSIAcl record;
-    int rc = EntryArgs(args, kUpdate, true, &t, &record);
+    int rc = EntryArgs(a, true, &t, &record);
     if (rc != 0) return rc;
     bool found = false;
     rc = FindEntry(t.tid, record.initiator, &found);
@@ -148,10 +127,10 @@ int RunUpdate(const Context &, const Args &args) {
     return 0;
 }
 
-int RunRemove(const Context &, const Args &args) {
+int RunRemove(const AclArgs &a) {
     ORLOiSCSITarget t;
     ORLOiSCSIAcl record;
-    int rc = EntryArgs(args, kRemove, false, &t, &record);
+    int rc = EntryArgs(a, false, &t, &record);
     if (rc != 0) return rc;
     std::vector<ORLOiSCSIAcl> entries;
     uint32_t ret = ORLOiSCSITargetMaskingGet(t.tid, entries);
@@ -172,26 +151,22 @@ int RunRemove(const Context &, const Args &args) {
     return 0;
 }
 
-int RunList(const Context &ctx, const Args &args) {
-    const OptionSpec specs[] = {{nullptr, false}};
-    ParsedOptions o;
-    if (!ParseOptionList(args, specs, &o) || o.positional.size() != 1) return UsageOf(kList);
+int RunList(const AclArgs &a) {
     ORLOiSCSITarget t;
-    int rc = TargetOf(o, &t);
+    int rc = TargetOf(a.target, &t);
     if (rc != 0) return rc;
     std::vector<ORLOiSCSIAcl> entries;
     uint32_t ret = ORLOiSCSITargetMaskingGet(t.tid, entries);
     if (ret != ORLO_OK) return Fail(ret);
-    if (ctx.json) {
-        printf("[");
-        bool first = true;
-        for (const ORLOiSCSIAcl &e : entries) {
-            printf("%s{\"initiator\":%s,\"default\":%s,\"authority\":%d,\"permission\":\"%s\"}", first ? "" : ",",
-                   JsonQuote(e.initiator).c_str(), IsDefault(e.initiator) ? "true" : "false", e.authority,
-                   PermissionWord(e.authority));
-            first = false;
-        }
-        printf("]\n");
+    if (Ctx().json) {
+        Json doc = Json::Array();
+        for (const ORLOiSCSIAcl &e : entries)
+            doc.Push(Json::Object()
+                         .SetStr("initiator", e.initiator)
+                         .SetBool("default", IsDefault(e.initiator))
+                         .SetInt("authority", e.authority)
+                         .SetStr("permission", PermissionWord(e.authority)));
+        PrintJson(doc);
         return 0;
     }
     printf("%-60s %s\n", "INITIATOR", "PERMISSION");
@@ -201,17 +176,12 @@ int RunList(const Context &ctx, const Args &args) {
     return 0;
 }
 
-int RunDefault(const Context &, const Args &args) {
-    const OptionSpec specs[] = {{nullptr, false}};
-    ParsedOptions o;
+int RunDefault(const AclArgs &a) {
     int32_t authority = 0;
-    if (!ParseOptionList(args, specs, &o) || o.positional.size() != 2) return UsageOf(kDefault);
-    if (!ParsePermission(o.positional[1], &authority)) {
-        fprintf(stderr, "orloiscsi: '%s' is not none, read-only or read-write\n", o.positional[1].c_str());
-        return UsageOf(kDefault);
-    }
+    if (!ParsePermission(a.permission, &authority))
+        return UsageError("'" + a.permission + "' is not none, read-only or read-write");
     ORLOiSCSITarget t;
-    int rc = TargetOf(o, &t);
+    int rc = TargetOf(a.target, &t);
     if (rc != 0) return rc;
     uint32_t ret = ORLOiSCSITargetDefaultAclSet(&t, authority);
     if (ret != ORLO_OK) return Fail(ret);
@@ -219,22 +189,47 @@ int RunDefault(const Context &, const Args &args) {
     return 0;
 }
 
-const Action kActions[] = {
-    {"add", "TARGET INITIATOR --ro|--rw|--none",
-     "let an initiator (its iSCSI name) log in to a target (tid or name), reading only, reading and writing, "
-     "or not at all",
-     RunAdd},
-    {"update", "TARGET INITIATOR --ro|--rw|--none", "change what a listed initiator may do", RunUpdate},
-    {"remove", "TARGET INITIATOR", "take an initiator off the access list", RunRemove},
-    {"list", "TARGET", "the target's access list, the default entry included", RunList},
-    {"default", "TARGET none|read-only|read-write", "what every initiator not listed may do", RunDefault},
-    {nullptr, nullptr, nullptr, nullptr},
-};
+// TARGET | --name NAME, first of the action's positionals.
+void AddTargetRef(CLI::App *act, std::string *ref) {
+    CLI::Option *pos = AddPositional(act, "TARGET", ref, "the target's tid or name");
+    AddAlias(act, pos, "--name", "NAME", "the target's name, as target create takes it");
+}
 
-int UsageOf(ActionIndex i) { return Usage(kAclObject, kActions[i]); }
+void AddInitiator(CLI::App *act, std::string *initiator) {
+    AddPositional(act, "INITIATOR", initiator, "the initiator's iSCSI name (iqn., eui. or naa.)");
+}
+
+void AddPermission(CLI::App *act, AclArgs *a) {
+    CLI::Option *ro = AddFlag(act, "--ro", &a->ro, "reading only");
+    CLI::Option *rw = AddFlag(act, "--rw", &a->rw, "reading and writing");
+    CLI::Option *none = AddFlag(act, "--none", &a->none, "not at all");
+    OneOf(act, {ro, rw, none}, true);
+}
 
 }  // namespace
 
-const Object kAclObject = {"acl", "access lists: which initiators may use a target, and how", kActions};
+void RegisterAcl(CLI::App *root) {
+    static AclArgs a;
+    CLI::App *obj = AddObject(root, "acl", "access lists: which initiators may use a target, and how");
+    CLI::App *act = AddAction(obj, "add",
+                              "let an initiator (its iSCSI name) log in to a target (tid or name), reading only, "
+                              "reading and writing, or not at all",
+                              [] { return RunAdd(a); });
+    AddTargetRef(act, &a.target);
+    AddInitiator(act, &a.initiator);
+    AddPermission(act, &a);
+    act = AddAction(obj, "update", "change what a listed initiator may do", [] { return RunUpdate(a); });
+    AddTargetRef(act, &a.target);
+    AddInitiator(act, &a.initiator);
+    AddPermission(act, &a);
+    act = AddAction(obj, "remove", "take an initiator off the access list", [] { return RunRemove(a); });
+    AddTargetRef(act, &a.target);
+    AddInitiator(act, &a.initiator);
+    act = AddAction(obj, "list", "the target's access list, the default entry included", [] { return RunList(a); });
+    AddTargetRef(act, &a.target);
+    act = AddAction(obj, "default", "what every initiator not listed may do", [] { return RunDefault(a); });
+    AddTargetRef(act, &a.target);
+    AddPositional(act, "none|read-only|read-write", &a.permission, "the right (ro and rw are taken too)");
+}
 
 }  // namespace cli

@@ -2,6 +2,7 @@
 #include <cstdio>
 #include <cstring>
 #include <string>
+#include <vector>
 
 #include "base/iscsi_base_internal.h"
 #include "cli.h"
@@ -36,110 +37,115 @@ class ConfLock {
     uint32_t code_ = ORLO_OK;
 };
 
-int RunSections(const Context &ctx, const Args &args) {
-    if (args.size() != 1) return Usage(kConfObject, kConfObject.actions[0]);
-    ConfLock lock(args[0].c_str(), false);
+struct ConfArgs {
+    std::string file, section;
+    std::vector<std::string> rest;  // KEY=VALUE... or SECTION...
+    bool replace = false;
+};
+
+int RunSections(const ConfArgs &a) {
+    ConfLock lock(a.file.c_str(), false);
     if (lock.code() != ORLO_OK) return Fail(lock.code());
     POLIBC_SZLIST list = nullptr;
-    int n = ORLOiSCSIConfSectionEnum(args[0].c_str(), &list);
+    int n = ORLOiSCSIConfSectionEnum(a.file.c_str(), &list);
     orlo::SzListGuard guard(list);
     if (n < 0) return Fail(ORLO_ERR_ENUM_SECTION);
-    if (ctx.json) printf("[");
-    for (int i = 0; i < n; ++i) {
-        const char *name = OLIBCSzListGet(list, i);
-        if (ctx.json)
-            printf("%s%s", i ? "," : "", JsonQuote(name).c_str());
-        else
-            printf("%s\n", name);
+    if (Ctx().json) {
+        Json doc = Json::Array();
+        for (int i = 0; i < n; ++i) doc.Push(Json::Str(OLIBCSzListGet(list, i)));
+        PrintJson(doc);
+        return 0;
     }
-    if (ctx.json) printf("]\n");
+    for (int i = 0; i < n; ++i) printf("%s\n", OLIBCSzListGet(list, i));
     return 0;
 }
 
-int RunGet(const Context &ctx, const Args &args) {
-    if (args.size() != 2) return Usage(kConfObject, kConfObject.actions[1]);
-    ConfLock lock(args[0].c_str(), false);
+int RunGet(const ConfArgs &a) {
+    ConfLock lock(a.file.c_str(), false);
     if (lock.code() != ORLO_OK) return Fail(lock.code());
     orlo::SzHashGuard hash(OLIBCSzHashAlloc(128));
     if (hash.get() == nullptr) return Fail(ORLO_ERR_OUT_OF_MEMORY);
-    int found = OLIBCFileGetSection(args[0].c_str(), args[1].c_str(), hash.addr());
-    if (found < 0) return Fail(OLIBCErrGet() == OLIBC_ERR_BAD_PARAM ? ORLO_ERR_BAD_PARAMETER : ORLO_ERR_GET_SECTION);
+    int found = OLIBCFileGetSection(a.file.c_str(), a.section.c_str(), hash.addr());
+    if (found < 0) {
+        uint32_t code = OLIBCErrGet() == OLIBC_ERR_BAD_PARAM ? ORLO_ERR_BAD_PARAMETER : ORLO_ERR_GET_SECTION;
+        if (!OLIBCFileExist(a.file.c_str())) fprintf(stderr, "orloiscsi: there is no file %s\n", a.file.c_str());
+        return Fail(code);
+    }
     if (found == 0) {
-        fprintf(stderr, "orloiscsi: no section [%s] in %s\n", args[1].c_str(), args[0].c_str());
+        fprintf(stderr, "orloiscsi: no section [%s] in %s\n", a.section.c_str(), a.file.c_str());
         return Fail(ORLO_ERR_GET_SECTION);
     }
     const char *k = nullptr, *v = nullptr;
-    if (ctx.json) printf("{");
+    Json doc = Json::Object();
     for (int i = 0; OLIBCSzHashEnum(hash.get(), i, &k, &v); ++i) {
-        if (ctx.json)
-            printf("%s%s:%s", i ? "," : "", JsonQuote(k).c_str(), JsonQuote(v).c_str());
+        if (Ctx().json)
+            doc.SetStr(k, v);
         else
             printf("%s=%s\n", k, v);
     }
-    if (ctx.json) printf("}\n");
+    if (Ctx().json) PrintJson(doc);
     return 0;
 }
 
-int RunPut(const Context &, const Args &args) {
-    bool replace = false;
-    Args rest;
-    for (const std::string &a : args) {
-        if (a == "--replace")
-            replace = true;
-        else
-            rest.push_back(a);
+int RunPut(const ConfArgs &a) {
+    const char *file = a.file.c_str();
+    const char *section = a.section.c_str();
+    for (const std::string &kv : a.rest) {
+        size_t eq = kv.find('=');
+        if (eq == std::string::npos || eq == 0) return UsageError("'" + kv + "' is not KEY=VALUE");
     }
-    if (rest.size() < 3) return Usage(kConfObject, kConfObject.actions[2]);
-    const char *file = rest[0].c_str();
-    const char *section = rest[1].c_str();
     ConfLock lock(file, true);
     if (lock.code() != ORLO_OK) return Fail(lock.code());
     orlo::SzHashGuard hash(OLIBCSzHashAlloc(128));
     if (hash.get() == nullptr) return Fail(ORLO_ERR_OUT_OF_MEMORY);
     // Without --replace the keys given are set and the section's other keys are kept.
-    if (!replace && OLIBCFileExist(file) && OLIBCFileGetSection(file, section, hash.addr()) < 0)
+    if (!a.replace && OLIBCFileExist(file) && OLIBCFileGetSection(file, section, hash.addr()) < 0)
         return Fail(OLIBCErrGet() == OLIBC_ERR_BAD_PARAM ? ORLO_ERR_BAD_PARAMETER : ORLO_ERR_GET_SECTION);
-    for (size_t i = 2; i < rest.size(); ++i) {
-        size_t eq = rest[i].find('=');
-        if (eq == std::string::npos || eq == 0) {
-            fprintf(stderr, "orloiscsi: '%s' is not KEY=VALUE\n", rest[i].c_str());
-            return 2;
-        }
-        std::string key = rest[i].substr(0, eq), value = rest[i].substr(eq + 1);
+    for (const std::string &kv : a.rest) {
+        size_t eq = kv.find('=');
+        std::string key = kv.substr(0, eq), value = kv.substr(eq + 1);
         if (OLIBCSzHashSetValue(hash.addr(), key.c_str(), value.c_str()) != 0) return Fail(ORLO_ERR_OUT_OF_MEMORY);
     }
     uint32_t ret = ORLOiSCSIPutSectionToConfig(file, section, hash.get());
     return ret == ORLO_OK ? 0 : Fail(ret);
 }
 
-int RunRemove(const Context &, const Args &args) {
-    if (args.size() < 2) return Usage(kConfObject, kConfObject.actions[3]);
-    const char *file = args[0].c_str();
-    orlo::SzListGuard list(OLIBCSzListAlloc(static_cast<int>(args.size())));
+int RunRemove(const ConfArgs &a) {
+    const char *file = a.file.c_str();
+    orlo::SzListGuard list(OLIBCSzListAlloc(static_cast<int>(a.rest.size()) + 1));
     if (list.get() == nullptr) return Fail(ORLO_ERR_OUT_OF_MEMORY);
-    for (size_t i = 1; i < args.size(); ++i)
-        if (OLIBCSzListPush(list.addr(), args[i].c_str()) < 0) return Fail(ORLO_ERR_OUT_OF_MEMORY);
+    for (const std::string &s : a.rest)
+        if (OLIBCSzListPush(list.addr(), s.c_str()) < 0) return Fail(ORLO_ERR_OUT_OF_MEMORY);
     ConfLock lock(file, true);
     if (lock.code() != ORLO_OK) return Fail(lock.code());
     uint32_t ret = ORLOiSCSIRemoveSectionList(file, list.get());
     return ret == ORLO_OK ? 0 : Fail(ret);
 }
 
-const Action kActions[] = {
-    {"sections", "FILE", "list the sections of a configuration file", RunSections},
-    {"get", "FILE SECTION", "print a section's keys, one KEY=VALUE a line", RunGet},
-    {"put", "[--replace] FILE SECTION KEY=VALUE...",
-     "set keys of a section, creating it (and the file) if needed; --replace drops the keys not given",
-     RunPut},
-    {"remove", "FILE SECTION...", "remove sections with their keys", RunRemove},
-    {nullptr, nullptr, nullptr, nullptr},
-};
+const char kFileHelp[] = "the section file, an appliance path such as /usr/orlo/etc/iscsi_target.conf";
 
 }  // namespace
 
-const Object kConfObject = {"conf",
-                            "read and change section files (appliance paths such as /usr/orlo/etc/iscsi_lun.conf), "
-                            "under their lock files",
-                            kActions};
+void RegisterConf(CLI::App *root) {
+    static ConfArgs a;
+    CLI::App *obj = AddObject(root, "conf",
+                              "read and change section files (appliance paths such as "
+                              "/usr/orlo/etc/iscsi_lun.conf), under their lock files");
+    CLI::App *act = AddAction(obj, "sections", "list the sections of a configuration file", [] { return RunSections(a); });
+    AddPositional(act, "FILE", &a.file, kFileHelp);
+    act = AddAction(obj, "get", "print a section's keys, one KEY=VALUE a line", [] { return RunGet(a); });
+    AddPositional(act, "FILE", &a.file, kFileHelp);
+    AddPositional(act, "SECTION", &a.section, "the section's name");
+    act = AddAction(obj, "put",
+                    "set keys of a section, creating it (and the file) if needed; --replace drops the keys not given",
+                    [] { return RunPut(a); });
+    AddFlag(act, "--replace", &a.replace, "the section keeps only the keys given");
+    AddPositional(act, "FILE", &a.file, kFileHelp);
+    AddPositional(act, "SECTION", &a.section, "the section's name");
+    AddPositionals(act, "KEY=VALUE", &a.rest, "a key and its value");
+    act = AddAction(obj, "remove", "remove sections with their keys", [] { return RunRemove(a); });
+    AddPositional(act, "FILE", &a.file, kFileHelp);
+    AddPositionals(act, "SECTION", &a.rest, "a section's name");
+}
 
 }  // namespace cli

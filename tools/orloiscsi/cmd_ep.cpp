@@ -16,26 +16,30 @@ const char *FileTypeName(uint32_t type) {
     return type < sizeof(kNames) / sizeof(kNames[0]) ? kNames[type] : "unknown";
 }
 
-int RunInfo(const Context &ctx, const Args &args) {
-    if (args.size() != 1) return Usage(kEpObject, kEpObject.actions[0]);
+int RunInfo(const std::string &volume) {
     ORLOiSCSIEpInfo info;
-    uint32_t ret = ORLOiSCSIEpInfoGet(args[0].c_str(), &info);
+    uint32_t ret = ORLOiSCSIEpInfoGet(volume.c_str(), &info);
     if (ret != ORLO_OK) return Fail(ret);
-    if (ctx.json) {
-        printf("{\"volume\":%s,\"exists\":%s,\"extent_size\":%" PRIu32 ",\"extent_shift\":%" PRIu32
-               ",\"total_extents\":%" PRIu64 ",\"free_extents\":%" PRIu64 ",\"used_bytes\":%" PRIu64
-               ",\"uuid\":%s,\"enabled\":%s,\"unmap_enabled\":%s,\"rod_enabled\":%s}\n",
-               JsonQuote(args[0]).c_str(), info.exists ? "true" : "false", info.extentSize, info.extentShift,
-               info.totalExtents, info.freeExtents, info.usedBytes, JsonQuote(info.uuid).c_str(),
-               info.enabled ? "true" : "false", info.unmapEnabled ? "true" : "false",
-               info.rodEnabled ? "true" : "false");
+    if (Ctx().json) {
+        PrintJson(Json::Object()
+                      .SetStr("volume", volume)
+                      .SetBool("exists", info.exists)
+                      .SetUint("extent_size", info.extentSize)
+                      .SetUint("extent_shift", info.extentShift)
+                      .SetUint("total_extents", info.totalExtents)
+                      .SetUint("free_extents", info.freeExtents)
+                      .SetUint("used_bytes", info.usedBytes)
+                      .SetStr("uuid", info.uuid)
+                      .SetBool("enabled", info.enabled)
+                      .SetBool("unmap_enabled", info.unmapEnabled)
+                      .SetBool("rod_enabled", info.rodEnabled));
         return 0;
     }
     if (!info.exists) {
-        printf("volume:       %s\npool:         none\n", args[0].c_str());
+        printf("volume:       %s\npool:         none\n", volume.c_str());
         return 0;
     }
-    printf("volume:       %s\n", args[0].c_str());
+    printf("volume:       %s\n", volume.c_str());
     printf("pool uuid:    %s\n", info.uuid);
     printf("extent size:  %" PRIu32 " bytes (shift %" PRIu32 ")\n", info.extentSize, info.extentShift);
     printf("extents:      %" PRIu64 " total, %" PRIu64 " free\n", info.totalExtents, info.freeExtents);
@@ -45,23 +49,27 @@ int RunInfo(const Context &ctx, const Args &args) {
     return 0;
 }
 
-int RunHeader(const Context &ctx, const Args &args) {
-    if (args.size() != 1) return Usage(kEpObject, kEpObject.actions[1]);
+int RunHeader(const std::string &file) {
     ORLOiSCSIEpFileHeaderInfo h;
-    uint32_t ret = ORLOiSCSIEpFileHeaderDecode(args[0].c_str(), &h);
+    uint32_t ret = ORLOiSCSIEpFileHeaderDecode(file.c_str(), &h);
     if (ret != ORLO_OK) return Fail(ret);
-    if (ctx.json) {
-        printf("{\"file\":%s,\"checksum\":%" PRIu32 ",\"checksum_computed\":%" PRIu32
-               ",\"checksum_ok\":%s,\"version\":%" PRIu32 ",\"magic_ok\":%s,\"file_type\":%" PRIu32
-               ",\"file_type_name\":%s,\"uuid\":%s,\"head_size\":%" PRIu32 ",\"create_time\":%" PRIu32
-               ",\"type_header_checksum_ok\":%s}\n",
-               JsonQuote(args[0]).c_str(), h.checksumStored, h.checksumComputed, h.checksumOk ? "true" : "false",
-               h.version, h.magicOk ? "true" : "false", h.fileType, JsonQuote(FileTypeName(h.fileType)).c_str(),
-               JsonQuote(h.uuid).c_str(), h.headSize, h.createTime,
-               !h.typeHeaderPresent ? "null" : h.typeChecksumOk ? "true" : "false");
+    if (Ctx().json) {
+        PrintJson(Json::Object()
+                      .SetStr("file", file)
+                      .SetUint("checksum", h.checksumStored)
+                      .SetUint("checksum_computed", h.checksumComputed)
+                      .SetBool("checksum_ok", h.checksumOk)
+                      .SetUint("version", h.version)
+                      .SetBool("magic_ok", h.magicOk)
+                      .SetUint("file_type", h.fileType)
+                      .SetStr("file_type_name", FileTypeName(h.fileType))
+                      .SetStr("uuid", h.uuid)
+                      .SetUint("head_size", h.headSize)
+                      .SetUint("create_time", h.createTime)
+                      .Set("type_header_checksum_ok", h.typeHeaderPresent ? Json::Bool(h.typeChecksumOk) : Json::Null()));
         return 0;
     }
-    printf("file:         %s\n", args[0].c_str());
+    printf("file:         %s\n", file.c_str());
     printf("checksum:     0x%08" PRIX32 " (%s; computed 0x%08" PRIX32 ")\n", h.checksumStored,
            h.checksumOk ? "good" : "BAD", h.checksumComputed);
     printf("version:      0x%08" PRIX32 "\n", h.version);
@@ -77,8 +85,7 @@ int RunHeader(const Context &ctx, const Args &args) {
     return h.checksumOk && h.magicOk ? 0 : 3;
 }
 
-int RunJournal(const Context &, const Args &args) {
-    if (args.size() != 1 || args[0] != "create") return Usage(kEpObject, kEpObject.actions[2]);
+int RunJournalCreate() {
     uint32_t ret = ORLOiSCSIEpJournalFileCreate();
     if (ret != ORLO_OK) return Fail(ret);
     char root[4096];
@@ -86,16 +93,22 @@ int RunJournal(const Context &, const Args &args) {
     return 0;
 }
 
-const Action kActions[] = {
-    {"info", "VOLUME", "the pool of a volume (/volumeN): extent size, used space, state in the kernel", RunInfo},
-    {"header", "FILE", "decode an extent-pool file's header and check its checksum (exit 3 when damaged)",
-     RunHeader},
-    {"journal", "create", "make the extent-pool journal under its root path", RunJournal},
-    {nullptr, nullptr, nullptr, nullptr},
-};
-
 }  // namespace
 
-const Object kEpObject = {"ep", "the extent pool behind advanced LUNs", kActions};
+void RegisterEp(CLI::App *root) {
+    static std::string volume, file, word;
+    CLI::App *obj = AddObject(root, "ep", "the extent pool behind advanced LUNs");
+    CLI::App *act = AddAction(obj, "info", "the pool of a volume (/volumeN): extent size, used space, state in the kernel",
+                              [] { return RunInfo(volume); });
+    AddPositional(act, "VOLUME", &volume, "the data volume, /volumeN");
+    act = AddAction(obj, "header", "decode an extent-pool file's header and check its checksum (exit 3 when damaged)",
+                    [] { return RunHeader(file); });
+    AddPositional(act, "FILE", &file, "an extent-pool file (appliance path)");
+    act = AddAction(obj, "journal", "make the extent-pool journal under its root path", [] {
+        if (word != "create") return UsageError("the only journal action is 'create'");
+        return RunJournalCreate();
+    });
+    AddPositional(act, "create", &word, "");
+}
 
 }  // namespace cli

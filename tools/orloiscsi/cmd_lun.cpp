@@ -70,64 +70,16 @@ bool ParseInt(const std::string &s, long min, long max, long *out) {
     return true;
 }
 
-std::string HumanSize(uint64_t bytes) {
-    static const char *const kUnits[] = {"B", "KiB", "MiB", "GiB", "TiB", "PiB"};
-    double v = static_cast<double>(bytes);
-    int u = 0;
-    while (v >= 1024.0 && u < 5) {
-        v /= 1024.0;
-        ++u;
-    }
-    char buf[32];
-    snprintf(buf, sizeof(buf), u == 0 ? "%.0f %s" : "%.1f %s", v, kUnits[u]);
-    return buf;
-}
-
-// Options of the form --key VALUE; the rest are positional.
-struct Options {
-    std::string name, type, size, volume, blockSize, lid, uuid, extentSize;
+// The arguments of every lun action (only the chosen action's are filled).
+struct LunArgs {
+    std::string lun, name, type, size, volume, blockSize, lid, uuid, extentSize;
     bool progress = false, all = false;
-    Args positional;
 };
 
-bool ParseOptions(const Args &args, Options *o) {
-    for (size_t i = 0; i < args.size(); ++i) {
-        const std::string &a = args[i];
-        std::string *slot = nullptr;
-        if (a == "--name") slot = &o->name;
-        else if (a == "--type") slot = &o->type;
-        else if (a == "--size") slot = &o->size;
-        else if (a == "--volume" || a == "--device") slot = &o->volume;
-        else if (a == "--block-size") slot = &o->blockSize;
-        else if (a == "--lid") slot = &o->lid;
-        else if (a == "--uuid") slot = &o->uuid;
-        else if (a == "--extent-size") slot = &o->extentSize;
-        else if (a == "--progress") { o->progress = true; continue; }
-        else if (a == "--all") { o->all = true; continue; }
-        else if (a.size() > 2 && a[0] == '-' && a[1] == '-') {
-            fprintf(stderr, "orloiscsi: unknown option '%s'\n", a.c_str());
-            return false;
-        } else {
-            o->positional.push_back(a);
-            continue;
-        }
-        if (i + 1 >= args.size()) {
-            fprintf(stderr, "orloiscsi: %s needs a value\n", a.c_str());
-            return false;
-        }
-        *slot = args[++i];
-    }
-    return true;
-}
-
-// Finds the LUN named by NAME, --lid N or --uuid U.  0 or a result code.
-uint32_t SelectLun(const Options &o, ORLOiSCSILun *lun, bool *usage) {
-    *usage = false;
-    int given = (!o.positional.empty()) + !o.lid.empty() + !o.uuid.empty();
-    if (given != 1 || o.positional.size() > 1) {
-        *usage = true;
-        return ORLO_ERR_BAD_PARAMETER;
-    }
+// Finds the LUN named by LUN (or --name), --lid N or --uuid U.  0 or a result code;
+// *usage when the command line was at fault (the exit status is then returned in *ret).
+uint32_t SelectLun(const LunArgs &o, ORLOiSCSILun *lun, int *exitStatus) {
+    *exitStatus = 0;
     if (!o.uuid.empty()) return ORLOiSCSILunConfGetByUuid(o.uuid.c_str(), lun);
     ORLOiSCSILunList list;
     ORLOiSCSIListInit(&list);
@@ -135,13 +87,12 @@ uint32_t SelectLun(const Options &o, ORLOiSCSILun *lun, bool *usage) {
     if (!o.lid.empty()) {
         long lid = 0;
         if (!ParseInt(o.lid, ORLO_ISCSI_LID_MIN, ORLO_ISCSI_LID_MAX, &lid)) {
-            fprintf(stderr, "orloiscsi: --lid takes a number from 1 to 1024\n");
-            *usage = true;
+            *exitStatus = UsageError("--lid takes a number from 1 to 1024");
             return ORLO_ERR_BAD_PARAMETER;
         }
         ret = ORLOiSCSILunConfGetByLid(static_cast<int32_t>(lid), ORLO_ISCSI_LUN_FILTER_BKP, &list);
     } else {
-        ret = ORLOiSCSILunConfGetByLunName(o.positional[0].c_str(), ORLO_ISCSI_LUN_FILTER_BKP, &list);
+        ret = ORLOiSCSILunConfGetByLunName(o.lun.c_str(), ORLO_ISCSI_LUN_FILTER_BKP, &list);
     }
     if (ret == ORLO_OK) {
         if (list.count < 1) {
@@ -159,15 +110,28 @@ uint32_t SelectLun(const Options &o, ORLOiSCSILun *lun, bool *usage) {
     return ret;
 }
 
-void PrintLunJson(const ORLOiSCSILun &l, int loaded, int locked) {
-    printf("{\"lid\":%d,\"name\":%s,\"type\":%s,\"size\":%" PRIu64 ",\"block_size\":%" PRIu32
-           ",\"root_path\":%s,\"uuid\":%s,\"vpd_unit_serial\":%s,\"extent_size\":%" PRIu32,
-           l.lid, JsonQuote(l.name).c_str(), JsonQuote(ORLOiSCSILunTypeName(l.type)).c_str(), l.size, l.blockSize,
-           JsonQuote(l.rootPath).c_str(), JsonQuote(l.uuid).c_str(), JsonQuote(l.vpdUnitSerial).c_str(),
-           l.extentSize);
-    if (loaded >= 0) printf(",\"loaded\":%s", loaded ? "true" : "false");
-    if (locked >= 0) printf(",\"locked\":%s", locked ? "true" : "false");
-    printf("}");
+// The LUN of a show, load, unload, delete or lock-status.  0, or the exit status.
+int LunOf(const LunArgs &o, ORLOiSCSILun *lun) {
+    int status = 0;
+    uint32_t ret = SelectLun(o, lun, &status);
+    if (status != 0) return status;
+    return ret == ORLO_OK ? 0 : Fail(ret);
+}
+
+Json LunJson(const ORLOiSCSILun &l, int loaded, int locked) {
+    Json o = Json::Object();
+    o.SetInt("lid", l.lid)
+        .SetStr("name", l.name)
+        .SetStr("type", ORLOiSCSILunTypeName(l.type))
+        .SetUint("size", l.size)
+        .SetUint("block_size", l.blockSize)
+        .SetStr("root_path", l.rootPath)
+        .SetStr("uuid", l.uuid)
+        .SetStr("vpd_unit_serial", l.vpdUnitSerial)
+        .SetUint("extent_size", l.extentSize);
+    if (loaded >= 0) o.SetBool("loaded", loaded != 0);
+    if (locked >= 0) o.SetBool("locked", locked != 0);
+    return o;
 }
 
 // This process's progress file, where the growth of a LUN's data file is published.
@@ -215,12 +179,7 @@ bool ShowProgress(const std::atomic<bool> &finished, unsigned long long *lastTot
     return shown;
 }
 
-int RunCreate(const Context &ctx, const Args &args) {
-    const Action &self = kLunObject.actions[0];
-    Options o;
-    if (!ParseOptions(args, &o) || !o.positional.empty() || o.name.empty() || o.type.empty() || o.size.empty() ||
-        o.volume.empty())
-        return Usage(kLunObject, self);
+int RunCreate(const LunArgs &o) {
     ORLOiSCSILun lun;
     memset(&lun, 0, sizeof(lun));
     lun.lockHandle = -1;
@@ -235,16 +194,16 @@ int RunCreate(const Context &ctx, const Args &args) {
     }
     long v = 0;
     if (!o.blockSize.empty()) {
-        if (!ParseInt(o.blockSize, 0, 1L << 30, &v)) return Usage(kLunObject, self);
+        if (!ParseInt(o.blockSize, 0, 1L << 30, &v)) return UsageError("--block-size takes a number of bytes");
         lun.blockSize = static_cast<uint32_t>(v);
     }
     if (!o.lid.empty()) {
-        if (!ParseInt(o.lid, 0, 1L << 30, &v)) return Usage(kLunObject, self);
+        if (!ParseInt(o.lid, 0, 1L << 30, &v)) return UsageError("--lid takes a number");
         lun.lid = static_cast<int32_t>(v);
     }
     if (!o.extentSize.empty()) {
         uint64_t es = 0;
-        if (!ParseSize(o.extentSize, &es) || es > UINT32_MAX) return Usage(kLunObject, self);
+        if (!ParseSize(o.extentSize, &es) || es > UINT32_MAX) return UsageError("--extent-size takes a size");
         lun.extentSize = static_cast<uint32_t>(es);
     }
     if (o.name.size() >= sizeof(lun.name) || o.volume.size() >= sizeof(lun.rootPath)) {
@@ -279,9 +238,8 @@ int RunCreate(const Context &ctx, const Args &args) {
         fprintf(stderr, "\n");
     }
     if (ret != ORLO_OK) return Fail(ret);
-    if (ctx.json) {
-        PrintLunJson(lun, -1, -1);
-        printf("\n");
+    if (Ctx().json) {
+        PrintJson(LunJson(lun, -1, -1));
     } else {
         printf("created LUN %d '%s' (%s, %s) on %s, uuid %s\n", lun.lid, lun.name, ORLOiSCSILunTypeName(lun.type),
                HumanSize(lun.size).c_str(), lun.rootPath, lun.uuid);
@@ -289,26 +247,21 @@ int RunCreate(const Context &ctx, const Args &args) {
     return 0;
 }
 
-int RunList(const Context &ctx, const Args &args) {
-    Options o;
-    if (!ParseOptions(args, &o) || !o.positional.empty()) return Usage(kLunObject, kLunObject.actions[1]);
+int RunList(const LunArgs &o) {
     ORLOiSCSILunList list;
     ORLOiSCSIListInit(&list);
     uint32_t ret = ORLOiSCSILunConfGetAll(&list, o.all ? ORLO_ISCSI_LUN_FILTER_BKP : 0);
     if (ret != ORLO_OK) return Fail(ret);
     ORLOiSCSIListLink *link;
     ORLOiSCSILun *l = nullptr;
-    if (ctx.json) {
-        printf("[");
-        bool first = true;
+    if (Ctx().json) {
+        Json doc = Json::Array();
         ORLO_ISCSI_LUN_LIST_FOREACH(&list, link, l) {
             int loaded = 0;
             if (ORLOiSCSILunIsLoaded(l, &loaded) != ORLO_OK) loaded = 0;
-            if (!first) printf(",");
-            PrintLunJson(*l, loaded, -1);
-            first = false;
+            doc.Push(LunJson(*l, loaded, -1));
         }
-        printf("]\n");
+        PrintJson(doc);
     } else {
         printf("%-5s %-24s %-10s %12s  %-7s %-12s %s\n", "LID", "NAME", "TYPE", "SIZE", "LOADED", "LOCATION", "UUID");
         ORLO_ISCSI_LUN_LIST_FOREACH(&list, link, l) {
@@ -322,20 +275,15 @@ int RunList(const Context &ctx, const Args &args) {
     return 0;
 }
 
-int RunShow(const Context &ctx, const Args &args) {
-    Options o;
+int RunShow(const LunArgs &o) {
     ORLOiSCSILun lun;
-    bool usage = false;
-    if (!ParseOptions(args, &o)) return Usage(kLunObject, kLunObject.actions[2]);
-    uint32_t ret = SelectLun(o, &lun, &usage);
-    if (usage) return Usage(kLunObject, kLunObject.actions[2]);
-    if (ret != ORLO_OK) return Fail(ret);
+    int rc = LunOf(o, &lun);
+    if (rc != 0) return rc;
     int loaded = 0, locked = 0;
     if (ORLOiSCSILunIsLoaded(&lun, &loaded) != ORLO_OK) loaded = 0;
     if (ORLOiSCSILunIsLocked(&lun, &locked) != ORLO_OK) locked = 0;
-    if (ctx.json) {
-        PrintLunJson(lun, loaded, locked);
-        printf("\n");
+    if (Ctx().json) {
+        PrintJson(LunJson(lun, loaded, locked));
         return 0;
     }
     printf("lid:             %d\n", lun.lid);
@@ -353,15 +301,11 @@ int RunShow(const Context &ctx, const Args &args) {
 }
 
 // load, unload and delete: one LUN, one library call.
-int RunOnOne(const Args &args, size_t actionIndex, uint32_t (*op)(ORLOiSCSILun *), const char *done) {
-    Options o;
+int RunOnOne(const LunArgs &o, uint32_t (*op)(ORLOiSCSILun *), const char *done) {
     ORLOiSCSILun lun;
-    bool usage = false;
-    if (!ParseOptions(args, &o)) return Usage(kLunObject, kLunObject.actions[actionIndex]);
-    uint32_t ret = SelectLun(o, &lun, &usage);
-    if (usage) return Usage(kLunObject, kLunObject.actions[actionIndex]);
-    if (ret != ORLO_OK) return Fail(ret);
-    ret = op(&lun);
+    int rc = LunOf(o, &lun);
+    if (rc != 0) return rc;
+    uint32_t ret = op(&lun);
     if (ret != ORLO_OK) return Fail(ret);
     printf("%s LUN %d '%s'\n", done, lun.lid, lun.name);
     return 0;
@@ -371,27 +315,23 @@ uint32_t Load(ORLOiSCSILun *l) { return ORLOiSCSILunLoad(l); }
 uint32_t Unload(ORLOiSCSILun *l) { return ORLOiSCSILunUnload(l); }
 uint32_t Delete(ORLOiSCSILun *l) { return ORLOiSCSILunDelete(l); }
 
-int RunLoad(const Context &, const Args &args) { return RunOnOne(args, 3, Load, "loaded"); }
-int RunUnload(const Context &, const Args &args) { return RunOnOne(args, 4, Unload, "unloaded"); }
-int RunDelete(const Context &, const Args &args) { return RunOnOne(args, 5, Delete, "deleted"); }
-
-int RunLockStatus(const Context &ctx, const Args &args) {
-    Options o;
+int RunLockStatus(const LunArgs &o) {
     ORLOiSCSILun lun;
-    bool usage = false;
-    if (!ParseOptions(args, &o)) return Usage(kLunObject, kLunObject.actions[6]);
-    uint32_t ret = SelectLun(o, &lun, &usage);
-    if (usage) return Usage(kLunObject, kLunObject.actions[6]);
-    if (ret != ORLO_OK) return Fail(ret);
+    int rc = LunOf(o, &lun);
+    if (rc != 0) return rc;
     ORLOiSCSILunProgress p;
-    ret = ORLOiSCSILunProgressGet(&lun, &p);
+    uint32_t ret = ORLOiSCSILunProgressGet(&lun, &p);
     if (ret != ORLO_OK) return Fail(ret);
-    if (ctx.json) {
-        printf("{\"lid\":%d,\"locked\":%s", lun.lid, p.isLocked ? "true" : "false");
+    if (Ctx().json) {
+        Json doc = Json::Object();
+        doc.SetInt("lid", lun.lid).SetBool("locked", p.isLocked);
         if (p.hasProgress)
-            printf(",\"pid\":%d,\"step\":%d,\"total_bytes\":%" PRIu64 ",\"org_path\":%s,\"new_path\":%s", p.pid,
-                   p.step, p.totalBytes, JsonQuote(p.orgPath).c_str(), JsonQuote(p.newPath).c_str());
-        printf("}\n");
+            doc.SetInt("pid", p.pid)
+                .SetInt("step", p.step)
+                .SetUint("total_bytes", p.totalBytes)
+                .SetStr("org_path", p.orgPath)
+                .SetStr("new_path", p.newPath);
+        PrintJson(doc);
         return 0;
     }
     printf("LUN %d '%s': %s\n", lun.lid, lun.name, p.isLocked ? "locked" : "not locked");
@@ -401,23 +341,50 @@ int RunLockStatus(const Context &ctx, const Args &args) {
     return 0;
 }
 
-const Action kActions[] = {
-    {"create", "--name NAME --type TYPE --size SIZE --volume /volumeN [--block-size 512|4096] [--lid N] "
-               "[--extent-size SIZE] [--progress]",
-     "create a LUN (TYPE: BLOCK, FILE, THIN, ADV, SINK, VDISK_ADV, BKP_THIN, BKP_ADV, CINDER, BLUN, VDISK_BLUN; "
-     "SIZE with K, M, G or T; a BLOCK LUN takes a /dev device as --volume)",
-     RunCreate},
-    {"list", "[--all]", "list the LUNs (--all: backup objects too)", RunList},
-    {"show", "NAME | --lid N | --uuid UUID", "show one LUN", RunShow},
-    {"load", "NAME | --lid N | --uuid UUID", "make the LUN a backstore of the kernel target", RunLoad},
-    {"unload", "NAME | --lid N | --uuid UUID", "take the LUN's backstore out of the kernel target", RunUnload},
-    {"delete", "NAME | --lid N | --uuid UUID", "delete the LUN, its data and its configuration", RunDelete},
-    {"lock-status", "NAME | --lid N | --uuid UUID", "whether an operation holds the LUN, and which", RunLockStatus},
-    {nullptr, nullptr, nullptr, nullptr},
-};
+// LUN | --name NAME | --lid N | --uuid UUID
+void AddLunRef(CLI::App *act, LunArgs *a) {
+    CLI::Option *pos = AddPositional(act, "LUN", &a->lun, "the LUN's name");
+    AddAlias(act, pos, "--name", "NAME", "the LUN's name, as lun create takes it");
+    CLI::Option *lid = AddValue(act, "--lid", "N", &a->lid, "the LUN's lid (1..1024)");
+    CLI::Option *uuid = AddValue(act, "--uuid", "UUID", &a->uuid, "the LUN's uuid");
+    OneOf(act, {pos, lid, uuid}, true);
+}
 
 }  // namespace
 
-const Object kLunObject = {"lun", "LUNs: create, list, load into the kernel target, unload, delete", kActions};
+void RegisterLun(CLI::App *root) {
+    static LunArgs a;
+    CLI::App *obj = AddObject(root, "lun", "LUNs: create, list, load into the kernel target, unload, delete");
+    CLI::App *act = AddAction(obj, "create",
+                              "create a LUN (TYPE: BLOCK, FILE, THIN, ADV, SINK, VDISK_ADV, BKP_THIN, BKP_ADV, CINDER, "
+                              "BLUN, VDISK_BLUN; SIZE with K, M, G or T; a BLOCK LUN takes a /dev device as --volume)",
+                              [] { return RunCreate(a); });
+    AddValue(act, "--name", "NAME", &a.name, "the new LUN's name (unique)")->required();
+    AddValue(act, "--type", "TYPE", &a.type, "BLOCK, FILE, THIN, ADV, SINK, VDISK_ADV, BKP_THIN, BKP_ADV, CINDER, "
+             "BLUN or VDISK_BLUN (any case)")->required();
+    AddValue(act, "--size", "SIZE", &a.size, "bytes, or a number with K, M, G or T (binary)")->required();
+    AddValue(act, "--volume,--device", "/volumeN", &a.volume, "the data volume, or a BLOCK LUN's /dev device")
+        ->required();
+    AddValue(act, "--block-size", "512|4096", &a.blockSize, "the logical block size (512 unless given)");
+    AddValue(act, "--lid", "N", &a.lid, "the lid to use (the smallest free one unless given)");
+    AddValue(act, "--extent-size", "SIZE", &a.extentSize, "an advanced LUN's extent size");
+    AddFlag(act, "--progress", &a.progress, "draw the progress bar also when standard error is no terminal");
+    act = AddAction(obj, "list", "list the LUNs (--all: backup objects too)", [] { return RunList(a); });
+    AddFlag(act, "--all", &a.all, "backup objects too");
+    act = AddAction(obj, "show", "show one LUN", [] { return RunShow(a); });
+    AddLunRef(act, &a);
+    act = AddAction(obj, "load", "make the LUN a backstore of the kernel target",
+                    [] { return RunOnOne(a, Load, "loaded"); });
+    AddLunRef(act, &a);
+    act = AddAction(obj, "unload", "take the LUN's backstore out of the kernel target",
+                    [] { return RunOnOne(a, Unload, "unloaded"); });
+    AddLunRef(act, &a);
+    act = AddAction(obj, "delete", "delete the LUN, its data and its configuration",
+                    [] { return RunOnOne(a, Delete, "deleted"); });
+    AddLunRef(act, &a);
+    act = AddAction(obj, "lock-status", "whether an operation holds the LUN, and which",
+                    [] { return RunLockStatus(a); });
+    AddLunRef(act, &a);
+}
 
 }  // namespace cli

@@ -20,17 +20,6 @@ const uint32_t kErrLoadMappingConf = 18990731;  // Failed to load mapping config
 // The library picks the smallest free LUN number for any number of 256 or more.
 const int32_t kAnyLunNumber = 256;
 
-enum ActionIndex { kAdd, kRemove, kList };
-
-int UsageOf(ActionIndex i);
-
-bool AllDigits(const std::string &s) {
-    if (s.empty()) return false;
-    for (char c : s)
-        if (c < '0' || c > '9') return false;
-    return true;
-}
-
 bool LooksLikeUuid(const std::string &s) {
     if (s.size() != ORLO_ISCSI_UUID_LEN) return false;
     for (size_t i = 0; i < s.size(); ++i) {
@@ -83,58 +72,58 @@ uint32_t StoredMapping(int32_t tid, int32_t lid, int32_t *number) {
     return ret;
 }
 
+// The arguments of every map action (only the chosen action's are filled).
+struct MapArgs {
+    std::string target, lun, number;
+};
+
 // TARGET and LUN of add and remove.  0, or the exit status.
-int FindPair(const ParsedOptions &o, ActionIndex i, ORLOiSCSITarget *t, ORLOiSCSILun *l) {
-    if (o.positional.size() != 2) return UsageOf(i);
-    uint32_t ret = FindTarget(o.positional[0], t);
+int FindPair(const MapArgs &a, ORLOiSCSITarget *t, ORLOiSCSILun *l) {
+    uint32_t ret = FindTarget(a.target, t);
     if (ret != ORLO_OK) return Fail(ret);
     explicit_bzero(t->password, sizeof(t->password));
     explicit_bzero(t->mutual_password, sizeof(t->mutual_password));
-    ret = FindLun(o.positional[1], l);
+    ret = FindLun(a.lun, l);
     if (ret != ORLO_OK) {
-        if (ret == kErrNoSuchLun) fprintf(stderr, "orloiscsi: no LUN '%s'\n", o.positional[1].c_str());
+        if (ret == kErrNoSuchLun) fprintf(stderr, "orloiscsi: no LUN '%s'\n", a.lun.c_str());
         return Fail(ret);
     }
     return 0;
 }
 
-int RunAdd(const Context &ctx, const Args &args) {
-    const OptionSpec specs[] = {{"--lun", true}, {nullptr, false}};
-    ParsedOptions o;
-    if (!ParseOptionList(args, specs, &o)) return UsageOf(kAdd);
+int RunAdd(const MapArgs &a, bool numberGiven) {
     int32_t number = kAnyLunNumber;
-    if (o.Has("--lun")) {
+    if (numberGiven) {
         long v = 0;
-        if (!ParseNumber(o.Last("--lun"), 0, ORLO_ISCSI_MAPPING_LUN_MAX, &v)) {
-            fprintf(stderr, "orloiscsi: --lun takes a LUN number from 0 to %d\n", ORLO_ISCSI_MAPPING_LUN_MAX);
-            return UsageOf(kAdd);
-        }
+        if (!ParseNumber(a.number, 0, ORLO_ISCSI_MAPPING_LUN_MAX, &v))
+            return UsageError("--lun takes a LUN number from 0 to " + std::to_string(ORLO_ISCSI_MAPPING_LUN_MAX));
         number = static_cast<int32_t>(v);
     }
     ORLOiSCSITarget t;
     ORLOiSCSILun l;
-    int rc = FindPair(o, kAdd, &t, &l);
+    int rc = FindPair(a, &t, &l);
     if (rc != 0) return rc;
     uint32_t ret = ORLOiSCSITargetMappingAdd(t.tid, l.lid, number);
     if (ret != ORLO_OK) return Fail(ret);
     // The number the library chose, as stored.
     if (StoredMapping(t.tid, l.lid, &number) != ORLO_OK) number = -1;
-    if (ctx.json) {
-        printf("{\"tid\":%d,\"target\":%s,\"lid\":%d,\"lun_name\":%s,\"lun\":%d}\n", t.tid, JsonQuote(t.name).c_str(),
-               l.lid, JsonQuote(l.name).c_str(), number);
+    if (Ctx().json) {
+        PrintJson(Json::Object()
+                      .SetInt("tid", t.tid)
+                      .SetStr("target", t.name)
+                      .SetInt("lid", l.lid)
+                      .SetStr("lun_name", l.name)
+                      .SetInt("lun", number));
     } else {
         printf("mapped LUN %d '%s' into target %d '%s' as LUN %d\n", l.lid, l.name, t.tid, t.name, number);
     }
     return 0;
 }
 
-int RunRemove(const Context &, const Args &args) {
-    const OptionSpec specs[] = {{nullptr, false}};
-    ParsedOptions o;
-    if (!ParseOptionList(args, specs, &o)) return UsageOf(kRemove);
+int RunRemove(const MapArgs &a) {
     ORLOiSCSITarget t;
     ORLOiSCSILun l;
-    int rc = FindPair(o, kRemove, &t, &l);
+    int rc = FindPair(a, &t, &l);
     if (rc != 0) return rc;
     int32_t number = -1;
     uint32_t ret = StoredMapping(t.tid, l.lid, &number);
@@ -147,15 +136,12 @@ int RunRemove(const Context &, const Args &args) {
     return 0;
 }
 
-int RunList(const Context &ctx, const Args &args) {
-    const OptionSpec specs[] = {{nullptr, false}};
-    ParsedOptions o;
-    if (!ParseOptionList(args, specs, &o) || o.positional.size() > 1) return UsageOf(kList);
+int RunList(const MapArgs &a) {
     ORLOiSCSILunFilter f = {};
     f.flags = ORLO_ISCSI_LUN_FILTER_ALL_WITH_BKP;
-    if (o.positional.size() == 1) {
+    if (!a.target.empty()) {
         ORLOiSCSITarget t;
-        uint32_t ret = FindTarget(o.positional[0], &t);
+        uint32_t ret = FindTarget(a.target, &t);
         f.tid = t.tid;
         explicit_bzero(&t, sizeof(t));
         if (ret != ORLO_OK) return Fail(ret);
@@ -168,21 +154,23 @@ int RunList(const Context &ctx, const Args &args) {
     if (ret != ORLO_OK) return Fail(ret);
     ORLOiSCSIListLink *link;
     ORLOiSCSIMapping *m = nullptr;
-    if (ctx.json) printf("[");
-    else printf("%-4s %-20s %-4s %-5s %s\n", "TID", "TARGET", "LUN", "LID", "LUN NAME");
-    bool first = true;
+    Json doc = Json::Array();
+    if (!Ctx().json) printf("%-4s %-20s %-4s %-5s %s\n", "TID", "TARGET", "LUN", "LID", "LUN NAME");
     ORLO_ISCSI_MAPPING_LIST_FOREACH(&conf.mappings, link, m) {
         const char *target = m->pTrg != nullptr ? m->pTrg->name : "-";
         const char *lun = m->pLun != nullptr ? m->pLun->name : "-";
-        if (ctx.json) {
-            printf("%s{\"tid\":%d,\"target\":%s,\"lun\":%d,\"lid\":%d,\"lun_name\":%s}", first ? "" : ",", m->tid,
-                   JsonQuote(target).c_str(), m->lun, m->lid, JsonQuote(lun).c_str());
+        if (Ctx().json) {
+            doc.Push(Json::Object()
+                         .SetInt("tid", m->tid)
+                         .SetStr("target", target)
+                         .SetInt("lun", m->lun)
+                         .SetInt("lid", m->lid)
+                         .SetStr("lun_name", lun));
         } else {
             printf("%-4d %-20s %-4d %-5d %s\n", m->tid, target, m->lun, m->lid, lun);
         }
-        first = false;
     }
-    if (ctx.json) printf("]\n");
+    if (Ctx().json) PrintJson(doc);
     // The snapshot's target records hold deciphered secrets.
     ORLOiSCSITarget *t = nullptr;
     ORLO_ISCSI_TARGET_LIST_FOREACH(&conf.targets, link, t) {
@@ -192,18 +180,6 @@ int RunList(const Context &ctx, const Args &args) {
     ORLOiSCSIConfFree(&conf);
     return 0;
 }
-
-const Action kActions[] = {
-    {"add", "TARGET LUN [--lun N]",
-     "map a LUN (name, lid or uuid) into a target (tid or name) as LUN number N (0..255; without --lun the "
-     "smallest free one); a running target shows it at once",
-     RunAdd},
-    {"remove", "TARGET LUN", "take a LUN out of a target, in the kernel and in the mapping file", RunRemove},
-    {"list", "[TARGET]", "the mappings of one target, or of all", RunList},
-    {nullptr, nullptr, nullptr, nullptr},
-};
-
-int UsageOf(ActionIndex i) { return Usage(kMapObject, kActions[i]); }
 
 }  // namespace
 
@@ -221,6 +197,26 @@ uint32_t FindLun(const std::string &ref, ORLOiSCSILun *lun) {
     return FirstLun(ORLOiSCSILunConfGetByLunName(ref.c_str(), ORLO_ISCSI_LUN_FILTER_BKP, &list), &list, lun);
 }
 
-const Object kMapObject = {"map", "LUN-target mappings: which LUN a target shows under which number", kActions};
+void RegisterMap(CLI::App *root) {
+    static MapArgs a;
+    static CLI::Option *number = nullptr;
+    CLI::App *obj = AddObject(root, "map", "LUN-target mappings: which LUN a target shows under which number");
+    // A mapping names a target and a LUN, both made with --name: they are told apart by
+    // their places.
+    CLI::App *act = AddAction(obj, "add",
+                              "map a LUN (name, lid or uuid) into a target (tid or name) as LUN number N (0..255; "
+                              "without --lun the smallest free one); a running target shows it at once",
+                              [] { return RunAdd(a, number->count() > 0); });
+    AddPositional(act, "TARGET", &a.target, "the target's tid or name");
+    AddPositional(act, "LUN", &a.lun, "the LUN's name, lid or uuid");
+    number = AddValue(act, "--lun", "N", &a.number, "the LUN number initiators see (0..255)");
+    act = AddAction(obj, "remove", "take a LUN out of a target, in the kernel and in the mapping file",
+                    [] { return RunRemove(a); });
+    AddPositional(act, "TARGET", &a.target, "the target's tid or name");
+    AddPositional(act, "LUN", &a.lun, "the LUN's name, lid or uuid");
+    act = AddAction(obj, "list", "the mappings of one target, or of all", [] { return RunList(a); });
+    CLI::Option *pos = AddPositional(act, "TARGET", &a.target, "the target's tid or name", false);
+    AddAlias(act, pos, "--name", "NAME", "the target's name, as target create takes it");
+}
 
 }  // namespace cli

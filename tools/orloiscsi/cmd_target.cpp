@@ -15,7 +15,9 @@
 #include <cerrno>
 #include <cinttypes>
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
+#include <map>
 #include <string>
 #include <vector>
 
@@ -41,10 +43,6 @@ const int32_t kDefaultSegBytes = 262144;
 const int32_t kDefaultMaxSessions = 1;
 // Generated IQNs: the maker's naming authority, then host and target name.
 const char kIqnPrefix[] = "iqn.2000-01.com.orlo-nas:";
-
-enum ActionIndex { kCreate, kList, kShow, kUpdate, kEnable, kDisable, kRemove, kStatus, kSessions };
-
-int UsageOf(ActionIndex i);
 
 // ---- Secrets ----
 
@@ -189,13 +187,6 @@ int GetSecret(const std::string &file, bool mutual, const char *user, char *fiel
 
 // ---- Names, IQNs, portals ----
 
-bool AllDigits(const std::string &s) {
-    if (s.empty()) return false;
-    for (char c : s)
-        if (c < '0' || c > '9') return false;
-    return true;
-}
-
 // Lower-case letters, digits, '.' and '-' as they are; anything else becomes '-'.
 std::string IqnWord(const std::string &s) {
     std::string o;
@@ -286,27 +277,34 @@ bool ParsePortal(const std::string &s, std::string *out) {
 
 // ---- Options shared by create and update ----
 
-const OptionSpec kTargetOptions[] = {
-    {"--name", true},           {"--iqn", true},
-    {"--chap", true},           {"--secret-file", true},
-    {"--mutual-chap", true},    {"--mutual-secret-file", true},
-    {"--no-chap", false},       {"--no-mutual-chap", false},
-    {"--portal", true},         {"--no-portals", false},
-    {"--header-digest", false}, {"--no-header-digest", false},
-    {"--data-digest", false},   {"--no-data-digest", false},
-    {"--max-recv-seg", true},   {"--max-send-seg", true},
-    {"--max-sessions", true},   {"--enabled", false},
-    {"--disabled", false},      {nullptr, false},
+// The options of create or update as given: values by option name, and which were given.
+struct TargetOptions {
+    std::string target;  // TARGET (update), NAME (create)
+    std::map<std::string, std::string> values;
+    std::map<std::string, bool> switches;
+    std::vector<std::string> portals;
+    std::vector<CLI::Option *> options;
+
+    bool Has(const std::string &name) const {
+        for (const CLI::Option *o : options)
+            if (o->check_name(name)) return o->count() > 0;
+        return false;
+    }
+    std::string Last(const std::string &name) const {
+        auto it = values.find(name);
+        return it == values.end() ? std::string() : it->second;
+    }
+    const std::vector<std::string> &All(const std::string &) const { return portals; }
+    bool AnyGiven() const {
+        for (const CLI::Option *o : options)
+            if (o->count() > 0) return true;
+        return false;
+    }
 };
 
-const OptionSpec kNoOptions[] = {{nullptr, false}};
-
-bool Conflict(const ParsedOptions &o, const char *a, const char *b) {
-    if (o.Has(a) && o.Has(b)) {
-        fprintf(stderr, "orloiscsi: %s and %s contradict each other\n", a, b);
-        return true;
-    }
-    return false;
+int Conflict(const TargetOptions &o, const char *a, const char *b) {
+    if (o.Has(a) && o.Has(b)) return UsageError(std::string(a) + " and " + b + " contradict each other");
+    return 0;
 }
 
 bool CopyField(const std::string &value, char *field, size_t size, const char *what) {
@@ -320,14 +318,17 @@ bool CopyField(const std::string &value, char *field, size_t size, const char *w
 
 // Applies the options of create/update to t (a new record or the stored one).  0, or the
 // exit status after saying why.
-int ApplyOptions(const ParsedOptions &o, ORLOiSCSITarget *t) {
-    if (Conflict(o, "--chap", "--no-chap") || Conflict(o, "--mutual-chap", "--no-mutual-chap") ||
-        Conflict(o, "--mutual-chap", "--no-chap") || Conflict(o, "--portal", "--no-portals") ||
-        Conflict(o, "--header-digest", "--no-header-digest") || Conflict(o, "--data-digest", "--no-data-digest") ||
-        Conflict(o, "--enabled", "--disabled"))
-        return 2;
-    if (o.Has("--name")) {
-        std::string name = o.Last("--name");
+int ApplyOptions(const TargetOptions &o, const std::string *newName, ORLOiSCSITarget *t) {
+    const char *const kPairs[][2] = {{"--chap", "--no-chap"},           {"--mutual-chap", "--no-mutual-chap"},
+                                     {"--mutual-chap", "--no-chap"},    {"--portal", "--no-portals"},
+                                     {"--header-digest", "--no-header-digest"},
+                                     {"--data-digest", "--no-data-digest"}, {"--enabled", "--disabled"}};
+    for (const auto &pair : kPairs) {
+        int rc = Conflict(o, pair[0], pair[1]);
+        if (rc != 0) return rc;
+    }
+    if (newName != nullptr) {
+        const std::string &name = *newName;
         if (AllDigits(name)) {
             fprintf(stderr, "orloiscsi: a target name of digits only would be taken for a tid\n");
             return Fail(kErrBadTargetName);
@@ -448,62 +449,27 @@ int ApplyOptions(const ParsedOptions &o, ORLOiSCSITarget *t) {
 
 // ---- Output ----
 
-const char *AuthName(int32_t a) {
-    return a == ORLO_ISCSI_AUTH_CHAP ? "CHAP" : a == ORLO_ISCSI_AUTH_MUTUAL_CHAP ? "mutual CHAP" : "none";
-}
-const char *AuthKey(int32_t a) {
-    return a == ORLO_ISCSI_AUTH_CHAP ? "chap" : a == ORLO_ISCSI_AUTH_MUTUAL_CHAP ? "mutual_chap" : "none";
-}
-
-// The kernel state of a status word.
-const char *KernelState(int word) {
-    if (word & ORLO_ISCSI_TARGET_STATUS_ENABLED) return "running";
-    if (word & ORLO_ISCSI_TARGET_STATUS_PRESENT) return "present";
-    return "absent";
-}
-
-const char *ConnectionName(char c) {
-    switch (c) {
-        case ORLO_ISCSI_TARGET_CONN_NONE: return "no sessions";
-        case ORLO_ISCSI_TARGET_CONN_ACTIVE: return "active";
-        case ORLO_ISCSI_TARGET_CONN_DOWN: return "not running";
-        default: return "unknown";
-    }
-}
-
-std::vector<std::string> SplitPortals(const char *list) {
-    std::vector<std::string> out;
-    std::string cur;
-    for (const char *p = list; *p != '\0'; ++p) {
-        if (*p == ',') {
-            if (!cur.empty()) out.push_back(cur);
-            cur.clear();
-        } else {
-            cur += *p;
-        }
-    }
-    if (!cur.empty()) out.push_back(cur);
-    return out;
-}
-
 // One target as a JSON object; never the secrets.
-void PrintTargetJson(const ORLOiSCSITarget &t, int status) {
-    printf("{\"tid\":%d,\"name\":%s,\"iqn\":%s,\"enabled\":%s,\"status\":%d,\"kernel\":\"%s\",\"auth\":\"%s\"", t.tid,
-           JsonQuote(t.name).c_str(), JsonQuote(t.iqn).c_str(), t.enabled ? "true" : "false", status,
-           KernelState(status), AuthKey(t.auth_type));
-    if (t.auth_type != ORLO_ISCSI_AUTH_NONE) printf(",\"chap_user\":%s", JsonQuote(t.user).c_str());
-    if (t.auth_type == ORLO_ISCSI_AUTH_MUTUAL_CHAP)
-        printf(",\"mutual_chap_user\":%s", JsonQuote(t.mutual_user).c_str());
-    printf(",\"header_digest\":%s,\"data_digest\":%s,\"max_recv_seg\":%d,\"max_send_seg\":%d,\"max_sessions\":%d",
-           t.has_header_checksum ? "true" : "false", t.has_data_checksum ? "true" : "false", t.max_recv_seg_bytes,
-           t.max_send_seg_bytes, t.max_sessions);
-    printf(",\"portals\":[");
-    bool first = true;
-    for (const std::string &p : SplitPortals(t.network_portals)) {
-        printf("%s%s", first ? "" : ",", JsonQuote(p).c_str());
-        first = false;
-    }
-    printf("],\"backup_object\":%s}", t.bkp_obj ? "true" : "false");
+Json TargetJson(const ORLOiSCSITarget &t, int status) {
+    Json o = Json::Object();
+    o.SetInt("tid", t.tid)
+        .SetStr("name", t.name)
+        .SetStr("iqn", t.iqn)
+        .SetBool("enabled", t.enabled)
+        .SetInt("status", status)
+        .SetStr("kernel", KernelState(status))
+        .SetStr("auth", AuthKey(t.auth_type));
+    if (t.auth_type != ORLO_ISCSI_AUTH_NONE) o.SetStr("chap_user", t.user);
+    if (t.auth_type == ORLO_ISCSI_AUTH_MUTUAL_CHAP) o.SetStr("mutual_chap_user", t.mutual_user);
+    o.SetBool("header_digest", t.has_header_checksum)
+        .SetBool("data_digest", t.has_data_checksum)
+        .SetInt("max_recv_seg", t.max_recv_seg_bytes)
+        .SetInt("max_send_seg", t.max_send_seg_bytes)
+        .SetInt("max_sessions", t.max_sessions);
+    Json portals = Json::Array();
+    for (const std::string &p : SplitPortals(t.network_portals)) portals.Push(Json::Str(p));
+    o.Set("portals", std::move(portals)).SetBool("backup_object", t.bkp_obj);
+    return o;
 }
 
 void PrintTargetText(const ORLOiSCSITarget &t, int status) {
@@ -536,27 +502,17 @@ struct TargetRecord {
     ~TargetRecord() { explicit_bzero(&t, sizeof(t)); }
 };
 
-// Looks up the one positional TARGET of an action.  0, or the exit status.
-int TargetArg(const Args &args, ActionIndex i, const OptionSpec *specs, ParsedOptions *o, TargetRecord *r) {
-    if (!ParseOptionList(args, specs, o) || o->positional.size() != 1) return UsageOf(i);
-    uint32_t ret = FindTarget(o->positional[0], &r->t);
+// Looks up the target an action names.  0, or the exit status.
+int TargetArg(const std::string &ref, TargetRecord *r) {
+    uint32_t ret = FindTarget(ref, &r->t);
     return ret == ORLO_OK ? 0 : Fail(ret);
 }
 
 // ---- Actions ----
 
-int RunCreate(const Context &ctx, const Args &args) {
-    ParsedOptions o;
-    if (!ParseOptionList(args, kTargetOptions, &o)) return UsageOf(kCreate);
-    if (o.Has("--name") || o.Has("--enabled") || o.Has("--no-chap") || o.Has("--no-mutual-chap") ||
-        o.Has("--no-portals")) {
-        fprintf(stderr, "orloiscsi: target create takes the name as its argument and has nothing to turn off\n");
-        return UsageOf(kCreate);
-    }
-    if (o.positional.size() != 1) return UsageOf(kCreate);
-    const std::string name = o.positional[0];
-    if (name.empty()) return UsageOf(kCreate);
-    o.values["--name"].push_back(name);
+int RunCreate(const TargetOptions &o) {
+    const std::string &name = o.target;
+    if (name.empty()) return UsageError("the target's name is empty");
 
     TargetRecord r;
     ORLOiSCSITarget &t = r.t;
@@ -565,7 +521,7 @@ int RunCreate(const Context &ctx, const Args &args) {
     t.max_send_seg_bytes = kDefaultSegBytes;
     t.max_sessions = kDefaultMaxSessions;
     t.auth_type = ORLO_ISCSI_AUTH_NONE;
-    int rc = ApplyOptions(o, &t);
+    int rc = ApplyOptions(o, &name, &t);
     if (rc != 0) return rc;
     if (!o.Has("--iqn")) {
         std::string iqn;
@@ -587,9 +543,8 @@ int RunCreate(const Context &ctx, const Args &args) {
         return Fail(ret);
     }
     int status = ORLOiSCSITargetStatusGet(t.tid, &t);
-    if (ctx.json) {
-        PrintTargetJson(t, status);
-        printf("\n");
+    if (Ctx().json) {
+        PrintJson(TargetJson(t, status));
     } else {
         printf("created target %d '%s' %s (%s, authentication %s)\n", t.tid, t.name, t.iqn,
                t.enabled ? KernelState(status) : "disabled", AuthName(t.auth_type));
@@ -597,27 +552,19 @@ int RunCreate(const Context &ctx, const Args &args) {
     return 0;
 }
 
-int RunList(const Context &ctx, const Args &args) {
-    const OptionSpec specs[] = {{"--all", false}, {nullptr, false}};
-    ParsedOptions o;
-    if (!ParseOptionList(args, specs, &o) || !o.positional.empty()) return UsageOf(kList);
+int RunList(bool all) {
     ORLOiSCSITargetFilter f = {};
-    f.flags = ORLO_ISCSI_TARGET_FILTER_ALL | (o.Has("--all") ? ORLO_ISCSI_TARGET_FILTER_BKP : 0);
+    f.flags = ORLO_ISCSI_TARGET_FILTER_ALL | (all ? ORLO_ISCSI_TARGET_FILTER_BKP : 0);
     ORLOiSCSITargetList list;
     ORLOiSCSIListInit(&list);
     uint32_t ret = ORLOiSCSITargetConfLoad(&f, &list);
     if (ret != ORLO_OK) return Fail(ret);
     ORLOiSCSIListLink *link;
     ORLOiSCSITarget *t = nullptr;
-    if (ctx.json) {
-        printf("[");
-        bool first = true;
-        ORLO_ISCSI_TARGET_LIST_FOREACH(&list, link, t) {
-            if (!first) printf(",");
-            PrintTargetJson(*t, ORLOiSCSITargetStatusGet(t->tid, t));
-            first = false;
-        }
-        printf("]\n");
+    if (Ctx().json) {
+        Json doc = Json::Array();
+        ORLO_ISCSI_TARGET_LIST_FOREACH(&list, link, t) { doc.Push(TargetJson(*t, ORLOiSCSITargetStatusGet(t->tid, t))); }
+        PrintJson(doc);
     } else {
         printf("%-4s %-20s %-8s %-8s %-12s %s\n", "TID", "NAME", "ENABLED", "KERNEL", "AUTH", "IQN");
         ORLO_ISCSI_TARGET_LIST_FOREACH(&list, link, t) {
@@ -634,80 +581,56 @@ int RunList(const Context &ctx, const Args &args) {
     return 0;
 }
 
-int RunShow(const Context &ctx, const Args &args) {
-    ParsedOptions o;
+int RunShow(const std::string &ref) {
     TargetRecord r;
-    int rc = TargetArg(args, kShow, kNoOptions, &o, &r);
+    int rc = TargetArg(ref, &r);
     if (rc != 0) return rc;
     int status = ORLOiSCSITargetStatusGet(r.t.tid, &r.t);
-    if (ctx.json) {
-        PrintTargetJson(r.t, status);
-        printf("\n");
-    } else {
+    if (Ctx().json)
+        PrintJson(TargetJson(r.t, status));
+    else
         PrintTargetText(r.t, status);
-    }
     return 0;
 }
 
-int RunUpdate(const Context &ctx, const Args &args) {
-    ParsedOptions o;
-    if (!ParseOptionList(args, kTargetOptions, &o) || o.positional.size() != 1) return UsageOf(kUpdate);
-    if (o.values.empty()) {
-        fprintf(stderr, "orloiscsi: nothing to change\n");
-        return UsageOf(kUpdate);
-    }
+int RunUpdate(const TargetOptions &o) {
+    if (!o.AnyGiven()) return UsageError("nothing to change");
     TargetRecord r;
-    uint32_t ret = FindTarget(o.positional[0], &r.t);
+    uint32_t ret = FindTarget(o.target, &r.t);
     if (ret != ORLO_OK) return Fail(ret);
-    int rc = ApplyOptions(o, &r.t);
+    std::string newName = o.Last("--name");
+    int rc = ApplyOptions(o, o.Has("--name") ? &newName : nullptr, &r.t);
     if (rc != 0) return rc;
     ret = ORLOiSCSITargetStructCheck(&r.t);
     if (ret != ORLO_OK) return Fail(ret);
     ret = ORLOiSCSITargetUpdate(&r.t);
     if (ret != ORLO_OK) return Fail(ret);
     int status = ORLOiSCSITargetStatusGet(r.t.tid, &r.t);
-    if (ctx.json) {
-        PrintTargetJson(r.t, status);
-        printf("\n");
+    if (Ctx().json) {
+        PrintJson(TargetJson(r.t, status));
     } else {
         printf("updated target %d '%s' (%s)\n", r.t.tid, r.t.name, r.t.enabled ? KernelState(status) : "disabled");
     }
     return 0;
 }
 
-int RunEnable(const Context &, const Args &args) {
-    ParsedOptions o;
+// enable, disable and remove: one target, one library call.
+int RunOnOne(const std::string &ref, uint32_t (*op)(ORLOiSCSITarget *), const char *done, bool showState) {
     TargetRecord r;
-    int rc = TargetArg(args, kEnable, kNoOptions, &o, &r);
+    int rc = TargetArg(ref, &r);
     if (rc != 0) return rc;
-    uint32_t ret = ORLOiSCSITargetEnable(&r.t);
+    uint32_t ret = op(&r.t);
     if (ret != ORLO_OK) return Fail(ret);
-    printf("enabled target %d '%s': %s\n", r.t.tid, r.t.name, KernelState(ORLOiSCSITargetStatusGet(r.t.tid, &r.t)));
+    if (showState)
+        printf("%s target %d '%s': %s\n", done, r.t.tid, r.t.name, KernelState(ORLOiSCSITargetStatusGet(r.t.tid, &r.t)));
+    else
+        printf("%s target %d '%s' with its mappings and access list\n", done, r.t.tid, r.t.name);
     return 0;
 }
 
-int RunDisable(const Context &, const Args &args) {
-    ParsedOptions o;
-    TargetRecord r;
-    int rc = TargetArg(args, kDisable, kNoOptions, &o, &r);
-    if (rc != 0) return rc;
-    uint32_t ret = ORLOiSCSITargetDisable(&r.t);
-    if (ret != ORLO_OK) return Fail(ret);
-    printf("disabled target %d '%s': %s\n", r.t.tid, r.t.name,
-           KernelState(ORLOiSCSITargetStatusGet(r.t.tid, &r.t)));
-    return 0;
-}
-
-int RunRemove(const Context &, const Args &args) {
-    ParsedOptions o;
-    TargetRecord r;
-    int rc = TargetArg(args, kRemove, kNoOptions, &o, &r);
-    if (rc != 0) return rc;
-    uint32_t ret = ORLOiSCSITargetRemove(&r.t);
-    if (ret != ORLO_OK) return Fail(ret);
-    printf("removed target %d '%s' with its mappings and access list\n", r.t.tid, r.t.name);
-    return 0;
-}
+uint32_t Enable(ORLOiSCSITarget *t) { return ORLOiSCSITargetEnable(t); }
+uint32_t Disable(ORLOiSCSITarget *t) { return ORLOiSCSITargetDisable(t); }
+uint32_t Remove(ORLOiSCSITarget *t) { return ORLOiSCSITargetRemove(t); }
 
 // Loads the target's sessions; their number, or -1.
 int LoadSessions(int32_t tid, ORLOiSCSISessionStateList *list) {
@@ -715,10 +638,9 @@ int LoadSessions(int32_t tid, ORLOiSCSISessionStateList *list) {
     return ORLOiSCSITargetSessionStateListGet(tid, list);
 }
 
-int RunStatus(const Context &ctx, const Args &args) {
-    ParsedOptions o;
+int RunStatus(const std::string &ref) {
     TargetRecord r;
-    int rc = TargetArg(args, kStatus, kNoOptions, &o, &r);
+    int rc = TargetArg(ref, &r);
     if (rc != 0) return rc;
     int status = ORLOiSCSITargetStatusGet(r.t.tid, &r.t);
     char conn = ORLO_ISCSI_TARGET_CONN_DOWN;
@@ -727,11 +649,16 @@ int RunStatus(const Context &ctx, const Args &args) {
     ORLOiSCSISessionStateList list;
     int sessions = LoadSessions(r.t.tid, &list);
     ORLOiSCSITargetSessionStateListFree(&list);
-    if (ctx.json) {
-        printf("{\"tid\":%d,\"name\":%s,\"enabled\":%s,\"status\":%d,\"kernel\":\"%s\",\"connection\":%d,"
-               "\"connection_state\":\"%s\",\"sessions\":%d}\n",
-               r.t.tid, JsonQuote(r.t.name).c_str(), r.t.enabled ? "true" : "false", status, KernelState(status),
-               conn, ConnectionName(conn), sessions);
+    if (Ctx().json) {
+        PrintJson(Json::Object()
+                      .SetInt("tid", r.t.tid)
+                      .SetStr("name", r.t.name)
+                      .SetBool("enabled", r.t.enabled)
+                      .SetInt("status", status)
+                      .SetStr("kernel", KernelState(status))
+                      .SetInt("connection", conn)
+                      .SetStr("connection_state", ConnectionName(conn))
+                      .SetInt("sessions", sessions));
         return 0;
     }
     printf("target %d '%s' %s\n", r.t.tid, r.t.name, r.t.iqn);
@@ -745,10 +672,9 @@ int RunStatus(const Context &ctx, const Args &args) {
     return 0;
 }
 
-int RunSessions(const Context &ctx, const Args &args) {
-    ParsedOptions o;
+int RunSessions(const std::string &ref) {
     TargetRecord r;
-    int rc = TargetArg(args, kSessions, kNoOptions, &o, &r);
+    int rc = TargetArg(ref, &r);
     if (rc != 0) return rc;
     ORLOiSCSISessionStateList list;
     int n = LoadSessions(r.t.tid, &list);
@@ -759,17 +685,17 @@ int RunSessions(const Context &ctx, const Args &args) {
     }
     ORLOiSCSIListLink *link;
     ORLOiSCSISessionState *s = nullptr;
-    if (ctx.json) {
-        printf("[");
-        bool first = true;
+    if (Ctx().json) {
+        Json doc = Json::Array();
         ORLO_ISCSI_SESSION_STATE_LIST_FOREACH(&list, link, s) {
             // The connection id is a decimal number; anything else is kept as text.
-            std::string cid = AllDigits(s->cid) ? std::string(s->cid) : JsonQuote(s->cid);
-            printf("%s{\"initiator\":%s,\"ip\":%s,\"cid\":%s}", first ? "" : ",", JsonQuote(s->iqn).c_str(),
-                   JsonQuote(s->ip).c_str(), cid.c_str());
-            first = false;
+            doc.Push(Json::Object()
+                         .SetStr("initiator", s->iqn)
+                         .SetStr("ip", s->ip)
+                         .Set("cid", AllDigits(s->cid) && strlen(s->cid) < 19 ? Json::Int(strtoll(s->cid, nullptr, 10))
+                                                                              : Json::Str(s->cid)));
         }
-        printf("]\n");
+        PrintJson(doc);
     } else {
         printf("%-48s %-40s %s\n", "INITIATOR", "IP", "CID");
         ORLO_ISCSI_SESSION_STATE_LIST_FOREACH(&list, link, s) { printf("%-48s %-40s %s\n", s->iqn, s->ip, s->cid); }
@@ -778,36 +704,91 @@ int RunSessions(const Context &ctx, const Args &args) {
     return 0;
 }
 
-#define TARGET_OPTIONS_USAGE                                                                                       \
-    "[--chap USER [--secret-file FILE]] [--mutual-chap USER [--mutual-secret-file FILE]] "                        \
-    "[--portal ADDR:PORT|[ADDR6]:PORT]... [--header-digest] [--data-digest] [--max-recv-seg BYTES] "               \
-    "[--max-send-seg BYTES] [--max-sessions N]"
+// The options of create (update: also the ones that turn things off, and --name to
+// rename).
+void AddTargetOptions(CLI::App *act, TargetOptions *o, bool update) {
+    auto value = [&](const char *name, const char *placeholder, const char *description) {
+        o->options.push_back(AddValue(act, name, placeholder, &o->values[name], description));
+    };
+    auto flag = [&](const char *name, const char *description) {
+        o->options.push_back(AddFlag(act, name, &o->switches[name], description));
+    };
+    if (update) value("--name", "NAME", "rename the target (names are unique and not all digits)");
+    value("--iqn", "IQN", "the target's iSCSI name (iqn., eui. or naa.); no two targets share one");
+    value("--chap", "USER", "one-way CHAP: initiators log in as USER");
+    value("--secret-file", "FILE", "the CHAP secret: the file's first line (- reads standard input); asked for on "
+                                   "the terminal when not given");
+    value("--mutual-chap", "USER", "mutual CHAP as well: the target answers as USER");
+    value("--mutual-secret-file", "FILE", "the mutual CHAP secret, as --secret-file");
+    if (update) {
+        flag("--no-chap", "turn CHAP off");
+        flag("--no-mutual-chap", "turn only mutual CHAP off");
+    }
+    o->options.push_back(AddValues(act, "--portal", "ADDR:PORT", &o->portals,
+                                   "a portal besides the appliance's interfaces: 192.0.2.1:3260 or [2001:db8::1]:3260"));
+    if (update) flag("--no-portals", "clear the portal list");
+    flag("--header-digest", "insist on CRC32C header digests");
+    flag("--data-digest", "insist on CRC32C data digests");
+    if (update) {
+        flag("--no-header-digest", "header digests CRC32C or none, as the initiator asks");
+        flag("--no-data-digest", "data digests CRC32C or none, as the initiator asks");
+    }
+    value("--max-recv-seg", "BYTES", "MaxRecvDataSegmentLength, 512..16777215");
+    value("--max-send-seg", "BYTES", "MaxXmitDataSegmentLength, 512..16777215");
+    value("--max-sessions", "N", "most sessions at one time, 0 for no limit");
+    if (update) flag("--enabled", "store the target enabled (service start starts it)");
+    flag("--disabled", update ? "store the target disabled" : "store the target without starting it");
+}
 
-const Action kActions[] = {
-    {"create", "NAME [--iqn IQN] " TARGET_OPTIONS_USAGE " [--disabled]",
-     "create a target and start it in the kernel (unless --disabled); without --iqn one is made from the "
-     "host name and NAME; CHAP secrets are asked for on the terminal unless given in a file",
-     RunCreate},
-    {"list", "[--all]", "list the targets with their kernel state (--all: backup objects too)", RunList},
-    {"show", "TARGET", "show one target (TARGET: tid or name); secrets are never shown", RunShow},
-    {"update",
-     "TARGET [--name NAME] [--iqn IQN] " TARGET_OPTIONS_USAGE
-     " [--no-chap] [--no-mutual-chap] [--no-portals] [--no-header-digest] [--no-data-digest] "
-     "[--enabled|--disabled]",
-     "change a target; what is not given is kept; a running target is restarted", RunUpdate},
-    {"enable", "TARGET", "load the target into the kernel and accept logins (the stored flag is kept)", RunEnable},
-    {"disable", "TARGET", "take the target out of the kernel (the stored flag is kept)", RunDisable},
-    {"remove", "TARGET", "take the target out of the kernel and remove it, its mappings and its access list",
-     RunRemove},
-    {"status", "TARGET", "kernel state (running, present, absent), connection state and number of sessions",
-     RunStatus},
-    {"sessions", "TARGET", "the target's iSCSI connections: initiator, IP address, connection id", RunSessions},
-    {nullptr, nullptr, nullptr, nullptr},
-};
-
-int UsageOf(ActionIndex i) { return Usage(kTargetObject, kActions[i]); }
+// TARGET | --name NAME
+void AddTargetRef(CLI::App *act, std::string *ref) {
+    CLI::Option *pos = AddPositional(act, "TARGET", ref, "the target's tid or name");
+    AddAlias(act, pos, "--name", "NAME", "the target's name, as target create takes it");
+}
 
 }  // namespace
+
+void RegisterTarget(CLI::App *root) {
+    static TargetOptions create, update;
+    static std::string ref;
+    static bool all = false;
+    CLI::App *obj = AddObject(root, "target", "iSCSI targets: create, list, change, run in the kernel, remove");
+    CLI::App *act = AddAction(obj, "create",
+                              "create a target and start it in the kernel (unless --disabled); without --iqn one is "
+                              "made from the host name and NAME; CHAP secrets are asked for on the terminal unless "
+                              "given in a file",
+                              [] { return RunCreate(create); });
+    CLI::Option *pos = AddPositional(act, "NAME", &create.target, "the new target's name (unique, not all digits)");
+    AddAlias(act, pos, "--name", "NAME", "the new target's name");
+    AddTargetOptions(act, &create, false);
+    act = AddAction(obj, "list", "list the targets with their kernel state (--all: backup objects too)",
+                    [] { return RunList(all); });
+    AddFlag(act, "--all", &all, "backup objects too");
+    act = AddAction(obj, "show", "show one target (TARGET: tid or name); secrets are never shown",
+                    [] { return RunShow(ref); });
+    AddTargetRef(act, &ref);
+    act = AddAction(obj, "update",
+                    "change a target (TARGET: tid or name; --name renames it); what is not given is kept; a running "
+                    "target is restarted",
+                    [] { return RunUpdate(update); });
+    AddPositional(act, "TARGET", &update.target, "the target's tid or name");
+    AddTargetOptions(act, &update, true);
+    act = AddAction(obj, "enable", "load the target into the kernel and accept logins (the stored flag is kept)",
+                    [] { return RunOnOne(ref, Enable, "enabled", true); });
+    AddTargetRef(act, &ref);
+    act = AddAction(obj, "disable", "take the target out of the kernel (the stored flag is kept)",
+                    [] { return RunOnOne(ref, Disable, "disabled", true); });
+    AddTargetRef(act, &ref);
+    act = AddAction(obj, "remove", "take the target out of the kernel and remove it, its mappings and its access list",
+                    [] { return RunOnOne(ref, Remove, "removed", false); });
+    AddTargetRef(act, &ref);
+    act = AddAction(obj, "status", "kernel state (running, present, absent), connection state and number of sessions",
+                    [] { return RunStatus(ref); });
+    AddTargetRef(act, &ref);
+    act = AddAction(obj, "sessions", "the target's iSCSI connections: initiator, IP address, connection id",
+                    [] { return RunSessions(ref); });
+    AddTargetRef(act, &ref);
+}
 
 uint32_t FindTarget(const std::string &ref, ORLOiSCSITarget *target) {
     if (AllDigits(ref)) {
@@ -821,7 +802,5 @@ uint32_t FindTarget(const std::string &ref, ORLOiSCSITarget *target) {
     }
     return ORLOiSCSITargetGetByName(ref.c_str(), ORLO_ISCSI_TARGET_FILTER_BKP, target);
 }
-
-const Object kTargetObject = {"target", "iSCSI targets: create, list, change, run in the kernel, remove", kActions};
 
 }  // namespace cli
