@@ -104,6 +104,7 @@ int main(int argc, char **argv) {
     OneOf(&app, {verbose, quiet}, false);
     app.set_version_flag("--version", std::string("orloiscsi ") + ORLO_VERSION, "print the version of orloiscsi");
 
+    RegisterOverview(&app);
     RegisterLun(&app);
     RegisterTarget(&app);
     RegisterMap(&app);
