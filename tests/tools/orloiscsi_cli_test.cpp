@@ -1,6 +1,6 @@
 // The command line itself, on a sandbox root without a kernel target: what is a usage
 // mistake (exit 2) and what a failure (exit 1), "--", options after the action, the
-// version, roots that cannot be used, JSON that json-c reads back.
+// version, roots that cannot be used, JSON that json-c reads back, and bash completion.
 #include <dirent.h>
 #include <gtest/gtest.h>
 #include <json-c/json.h>
@@ -8,10 +8,12 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <fstream>
 #include <memory>
+#include <sstream>
 #include <string>
 #include <vector>
 
@@ -272,6 +274,73 @@ TEST_F(OrloiscsiCommandLine, JsonDocumentsReadBackByteForByte) {
     EXPECT_EQ("[{\"code\":4294967294,\"signed\":-2,\"message\":\"No such file or directory\"},"
               "{\"code\":18990004,\"signed\":18990004,\"message\":\"Bad parameter\"}]\n",
               out);
+}
+
+// Completes the words as bash would, with the completion script sourced; the offers,
+// sorted.
+std::vector<std::string> Complete(const std::vector<std::string> &words) {
+    std::vector<std::string> argv = {"/bin/bash", "-c",
+                                     "source \"$1\"; shift; COMP_WORDS=(\"$@\"); COMP_CWORD=$(($# - 1)); "
+                                     "_orloiscsi; printf '%s\\n' \"${COMPREPLY[@]}\"",
+                                     "bash", std::string(ORLO_SOURCE_DIR) + "/tools/completion/orloiscsi", Tool()};
+    argv.insert(argv.end(), words.begin(), words.end());
+    std::string out, err;
+    EXPECT_EQ(0, RunProgram(argv, &out, &err)) << err;
+    std::vector<std::string> offers;
+    std::istringstream in(out);
+    std::string line;
+    while (std::getline(in, line))
+        if (!line.empty()) offers.push_back(line);
+    std::sort(offers.begin(), offers.end());
+    return offers;
+}
+
+using Offers = std::vector<std::string>;
+
+TEST_F(OrloiscsiCommandLine, BashCompletionOffersObjectsActionsOptionsAndNames) {
+    // Two roots: the sandbox (ORLO_SYSROOT of every program run here) and another one
+    // named with --root on the line being completed.
+    const std::string other = orlotest::MakeTempDir("orlo-other");
+    ASSERT_FALSE(other.empty());
+    std::string out, err;
+    for (const char *t : {"web", "db"})
+        ASSERT_EQ(0, RunProgram({Tool(), "--root", other, "target", "create", t, "--disabled"}, &out, &err)) << err;
+    ASSERT_EQ(0, Cli({"target", "create", "elsewhere", "--disabled"}, &out, &err)) << err;
+    std::string luns;
+    for (int lid : {1, 2}) {
+        std::string uuid = "0000000" + std::to_string(lid) + "-0000-4000-8000-000000000000";
+        luns += "[LUN_" + uuid + "]\n\tlid=" + std::to_string(lid) + "\n\tname=" + (lid == 1 ? "data" : "logs") +
+                "\n\trootpath=/volume1\n\tuuid=" + uuid + "\n\tvpd_unit_serial=s" + std::to_string(lid) +
+                "\n\tbytes=1048576\n\trestored_time=0\n\tdevtype=1\n\tpre_alloc=yes\n\tbkp_obj=0\n\tvaai_support=no\n";
+    }
+    {
+        std::string dir = other + "/usr/orlo/etc";
+        std::ofstream(dir + "/iscsi_lun.conf") << luns;
+    }
+    ASSERT_EQ(0, RunProgram({Tool(), "--root", other, "lun", "list"}, &out, &err)) << err;
+    ASSERT_TRUE(Has(out, "logs")) << out;
+
+    Offers objects = Complete({""});
+    EXPECT_TRUE(std::find(objects.begin(), objects.end(), "overview") != objects.end());
+    EXPECT_TRUE(std::find(objects.begin(), objects.end(), "errstr") != objects.end());
+    EXPECT_TRUE(std::find(objects.begin(), objects.end(), "help") == objects.end()) << "hidden actions are not offered";
+    EXPECT_EQ(Offers({"list", "load", "lock-status"}), Complete({"--json", "lun", "l"}));
+    EXPECT_EQ(Offers({"--data-digest", "--disabled"}), Complete({"target", "update", "web", "--d"}));
+    EXPECT_EQ(Offers({"--json"}), Complete({"lun", "show", "--j"})) << "global options after the action too";
+
+    // Names from the root on the line, wherever it stands.
+    EXPECT_EQ(Offers({"data", "logs"}), Complete({"--root", other, "lun", "show", ""}));
+    EXPECT_EQ(Offers({"logs"}), Complete({"lun", "delete", "--root=" + other, "--name", "l"}));
+    EXPECT_EQ(Offers({"db", "web"}), Complete({"--root", other, "acl", "add", ""}));
+    EXPECT_EQ(Offers({"db", "web"}), Complete({"--root", other, "acl", "list", "--name", ""}));
+    EXPECT_EQ(Offers({"data", "logs"}), Complete({"--root", other, "map", "add", "web", ""}))
+        << "the second positional of map add is a LUN";
+    EXPECT_EQ(Offers({}), Complete({"--root", other, "acl", "add", "web", ""})) << "an initiator is not a target";
+    EXPECT_EQ(Offers({"elsewhere"}), Complete({"target", "show", ""})) << "without --root: ORLO_SYSROOT";
+    // Values the placeholder lists.
+    EXPECT_EQ(Offers({"lio", "lio4x"}), Complete({"service", "version", "--set", ""}));
+    EXPECT_EQ(Offers({"read-only", "read-write"}), Complete({"acl", "default", "web", "r"}));
+    orlotest::RemoveTree(other);
 }
 
 }  // namespace

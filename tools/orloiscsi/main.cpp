@@ -130,6 +130,14 @@ int main(int argc, char **argv) {
         return 0;
     });
     AddPositionals(help, "WORD", &helpWords, "", false);
+    // The words bash completion may offer (tools/completion/orloiscsi).
+    std::vector<std::string> completeWords;
+    CLI::App *complete = AddHiddenAction(&app, "__complete", [&app, &completeWords] {
+        fputs(CompletionWords(&app, completeWords).c_str(), stdout);
+        return 0;
+    });
+    AddPositionals(complete, "WORD", &completeWords, "", false);
+
     Chosen chosen;
     int status = 0;
     if (!Parse(&app, argc, argv, &chosen, &status)) return status;
