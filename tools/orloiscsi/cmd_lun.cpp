@@ -77,7 +77,8 @@ struct LunArgs {
 };
 
 // Finds the LUN named by LUN (or --name), --lid N or --uuid U.  0 or a result code;
-// *usage when the command line was at fault (the exit status is then returned in *ret).
+// when the command line was at fault, *exitStatus holds the exit status (after the
+// usage line has been printed).
 uint32_t SelectLun(const LunArgs &o, ORLOiSCSILun *lun, int *exitStatus) {
     *exitStatus = 0;
     if (!o.uuid.empty()) return ORLOiSCSILunConfGetByUuid(o.uuid.c_str(), lun);
