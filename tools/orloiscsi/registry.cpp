@@ -122,16 +122,15 @@ std::string RenderArguments(const CLI::App *app) {
             if (!g->required) part = "[" + part + "]";
             parts.emplace_back(part, g->required);
             continue;
-        } else {
-            bool required = opt->get_required();
-            auto s = r.slotOf.find(opt);
-            if (s != r.slotOf.end()) required = s->second->required;
-            auto act = r.actions.find(app);
-            if (act != r.actions.end() && act->second.rest == opt) required = act->second.restRequired;
-            part = RenderOne(opt);
-            if (!required) part = "[" + part + "]";
-            parts.emplace_back(part, required && part.find(" | ") != std::string::npos);
         }
+        bool required = opt->get_required();
+        auto s = r.slotOf.find(opt);
+        if (s != r.slotOf.end()) required = s->second->required;
+        auto act = r.actions.find(app);
+        if (act != r.actions.end() && act->second.rest == opt) required = act->second.restRequired;
+        part = RenderOne(opt);
+        if (!required) part = "[" + part + "]";
+        parts.emplace_back(part, required && part.find(" | ") != std::string::npos);
     }
     // Alternatives are bracketed only when something else stands beside them.
     std::string line;
