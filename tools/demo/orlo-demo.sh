@@ -168,6 +168,12 @@ run 'orloiscsi --root $ROOT service start'
 run 'orloiscsi --root $ROOT target status demo'
 run 'ls $ROOT/config/target/iscsi/iqn.2000-01.com.orlo-nas:demo/tpgt_1/lun'
 
+step "One look at everything, while it runs"
+run 'orloiscsi --root $ROOT overview'
+
 step "Taking everything out of the kernel"
 run 'orloiscsi --root $ROOT service total-stop'
 run 'cat $ROOT/config/.sim/modules; echo "(no module left)"'
+
+step "One look at everything: stored, and what the kernel no longer has"
+run 'orloiscsi --root $ROOT overview'
