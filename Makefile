@@ -12,7 +12,7 @@ PREFIX     ?= /usr/local
 
 DEB_PACKAGES = build-essential cmake pkg-config libgtest-dev libgmock-dev libbenchmark-dev \
                libjson-c-dev libssl-dev uuid-dev libcrypt-dev libfuse3-dev fuse3 \
-               libcli11-dev btrfs-progs e2fsprogs util-linux
+               libcli11-dev btrfs-progs e2fsprogs util-linux libisns-dev open-isns-server open-isns-utils
 
 SUDO := $(shell [ "$$(id -u)" = 0 ] || echo sudo)
 

@@ -261,18 +261,56 @@ ORLO_EXPORT uint32_t ORLOiSCSITargetPortalGroupNodeAclRemove(const char *acl_pat
 ORLO_EXPORT uint32_t ORLOiSCSITargetPortalGroupLunRemoveEntry(const char *lun_path);
 
 /* ---- iSNS client ----
- * Targets are announced to an iSNS server when /usr/orlo/etc/isns.conf says
- * isns_enable=yes (key=value lines; the server in isns_server).  iSNS is off unless that
- * file turns it on; while it is off these calls do nothing, succeed and report the
- * client not connected.  The iSNS protocol itself is not built yet: with iSNS on,
- * connecting reports 18990213 "Not implemented yet" and the client stays disconnected. */
+ * Running targets are announced to an iSNS server (RFC 4171) when
+ * /usr/orlo/etc/isns.conf (key=value lines) says isns_enable=yes; the server is
+ * isns_server ("name", "a.b.c.d", "[v6]", each with an optional ":port", 3205 otherwise).
+ * Optional keys: isns_entity (the entity this appliance registers as; the host name
+ * otherwise), isns_registration_period (seconds asked of the server, 3600 unless set)
+ * and isns_timeout (seconds a connection attempt may take, 1..60, 5 unless set).  The
+ * appliance is one entity; every target in the kernel (backup objects left out) is a
+ * storage node in it with the portals of its portal group.  While iSNS is off every call
+ * here does nothing and succeeds.  Register and deregister are best effort: the target
+ * life cycle never checks them.  Each failure is logged once.  The client keeps no
+ * socket, thread or timer between calls; registrations stay on the server for the
+ * registration period and are renewed by every connection, by ORLOiSCSIiSNSRefresh and
+ * by a connected process whose registrations are half-way to expiry.  All take the
+ * target lock. */
 ORLO_EXPORT bool ORLOiSCSIiSNSIsEnabled(void);
+/* Connects and registers every running target, withdrawing the entity's other nodes. */
 ORLO_EXPORT uint32_t ORLOiSCSIiSNSConnect(void);
 ORLO_EXPORT bool ORLOiSCSIiSNSIsConnected(void);
+/* Withdraws the whole entity from the server and forgets the connection. */
 ORLO_EXPORT uint32_t ORLOiSCSIiSNSDisconnect(void);
+/* Renews the registrations (connecting when needed); run it periodically. */
+ORLO_EXPORT uint32_t ORLOiSCSIiSNSRefresh(void);
+/* isns_enable=yes, then every running target registered (that result returned). */
+ORLO_EXPORT uint32_t ORLOiSCSIiSNSEnable(void);
+/* The entity withdrawn (best effort), then isns_enable=no. */
+ORLO_EXPORT uint32_t ORLOiSCSIiSNSDisable(void);
+/* A new isns_server (18990203 / 18990428 for a malformed one); with iSNS on, withdrawn
+ * from the old server and registered with the new one. */
+ORLO_EXPORT uint32_t ORLOiSCSIiSNSServerSet(const char *server);
+
+typedef struct _tag_struct_iscsi_isns_status_ {
+    bool enabled;                /* isns_enable says yes */
+    bool connected;              /* this process is connected */
+    bool reachable;              /* the server answered the status query just now */
+    char server[256];            /* isns_server as written ("" when unset) */
+    char entity[256];            /* the entity this appliance registers as */
+    int32_t port;                /* the server's port */
+    int32_t timeout;             /* seconds a connection attempt may take */
+    int32_t registration_period; /* seconds asked of the server */
+    int32_t granted_period;      /* seconds the server granted this process (0: not known) */
+    int32_t registered;          /* storage nodes the server holds in the entity (-1: not known) */
+    uint32_t error;              /* why the settings or the server failed: 0 or a result code */
+} ORLOiSCSIiSNSStatus;
+ORLO_EXPORT uint32_t ORLOiSCSIiSNSStatusGet(ORLOiSCSIiSNSStatus *status);
+
 /* Best effort: callers never check these. */
 ORLO_EXPORT uint32_t ORLOiSCSITargetiSNSRegister(const ORLOiSCSITarget *target);
 ORLO_EXPORT uint32_t ORLOiSCSITargetiSNSDeregister(const ORLOiSCSITarget *target);
+/* Whether the server holds the target in this appliance's entity (false with iSNS off). */
+ORLO_EXPORT uint32_t ORLOiSCSITargetiSNSIsRegistered(const ORLOiSCSITarget *target, bool *registered);
 
 /* ---- Access lists in the kernel: node access lists, their LUN entries and CHAP ----
  * Paths lie under "/config/target/iscsi/<iqn>/tpgt_<tpgt>/acls/<initiator>".  The default

@@ -1,4 +1,5 @@
-// Whether the iSNS client of this process is connected.
+// Whether this process is connected to the iSNS server (it reached the server and
+// registered the running targets, and nothing has failed since).
 #include "orloiscsi_target.h"
 #include "target/isns_client.h"
 
