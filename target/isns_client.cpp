@@ -46,7 +46,6 @@ const char kTimeoutKey[] = "isns_timeout";
 namespace {
 
 constexpr uint32_t kErrReadFile = 18990039;  // Failed to read file
-constexpr uint32_t kErrBadPortals = 18990402;  // Bad portals: more than one message holds
 // The source name of the messages that speak for the whole entity rather than for one
 // of its targets: this prefix and the entity name in iSCSI-name characters.
 constexpr const char kSourcePrefix[] = "iqn.2000-01.com.orlo-nas:isns.";
@@ -498,8 +497,8 @@ uint32_t TakePicture(Picture *pic) {
 //
 // libisns encodes a message into a buffer of ISNS_MAX_MESSAGE (8 KiB) bytes and does
 // not survive a larger one, and fails on answers that large: each message here carries
-// one target, and its size is reckoned (attribute headers, values padded to 4 bytes)
-// before it is built.
+// one target at most, its size reckoned (attribute headers, values padded to 4 bytes)
+// as it is built, and no question asks for more than a few portals or one node.
 constexpr size_t kMessageBudget = 7168;
 
 size_t AttrSize(size_t valueBytes) { return 8 + ((valueBytes + 3) & ~size_t{3}); }
@@ -533,34 +532,8 @@ isns_object_t *MakePortalGroup(const char *iqn, const Portal &p, bool listens) {
     return pg;
 }
 
-// Registers one target with every portal of the entity and a portal group for each.
-uint32_t SendRegistration(Session &ses, const Settings &s, const ORLOiSCSITarget &t, const std::set<Portal> &own,
-                          const std::set<Portal> &all) {
-    size_t size = 12 + 2 * StringAttr(t.iqn) + 2 * StringAttr(s.entity.c_str()) + 2 * AttrSize(4) +
-                  AttrSize(4) + StringAttr(t.name) + 8 +
-                  all.size() * (2 * AttrSize(16) + 2 * AttrSize(4) + StringAttr(t.iqn));
-    if (size > kMessageBudget) {
-        ORLO_LOG_ERR("Registration of \"%s\" with %zu portals would take %zu bytes, more than an iSNS message "
-                     "holds (%zu), err=%s",
-                     t.iqn, all.size(), size, kMessageBudget, ORLOiSCSIErrStr(kErrBadPortals));
-        return kErrBadPortals;
-    }
-    Objects objs;
-    isns_object_t *entity = objs.Keep(isns_create_entity(ISNS_ENTITY_PROTOCOL_ISCSI, s.entity.c_str()));
-    isns_object_set_uint32(entity, ISNS_TAG_REGISTRATION_PERIOD, static_cast<uint32_t>(s.period));
-    isns_object_t *node = objs.Keep(isns_create_iscsi_target(t.iqn, entity));
-    if (t.name[0] != '\0') isns_object_set_string(node, ISNS_TAG_ISCSI_ALIAS, t.name);
-    SourceGuard src(t.iqn);
-    isns_client_t client = {src.get(), ses.socket()};
-    isns_simple_t *msg = isns_create_registration(&client, entity);
-    isns_registration_add_object(msg, entity);
-    isns_registration_add_object(msg, node);
-    for (const Portal &p : all) isns_registration_add_object(msg, objs.Keep(MakePortalObject(p, entity)));
-    for (const Portal &p : all)
-        isns_registration_add_object(msg, objs.Keep(MakePortalGroup(t.iqn, p, own.count(p) != 0)));
-    isns_simple_t *reply = nullptr;
-    uint32_t ret = ses.Call(msg, &reply, "DevAttrReg", t.iqn);
-    if (ret != ORLO_OK) return ret;
+// Reads the registration period the server granted from a registration's answer.
+void NoteGranted(isns_simple_t *reply) {
     isns_object_list_t list = {0, nullptr};
     isns_registration_response_get_objects(reply, &list);
     for (unsigned i = 0; i < list.iol_count; ++i) {
@@ -568,7 +541,57 @@ uint32_t SendRegistration(Session &ses, const Settings &s, const ORLOiSCSITarget
         if (isns_object_get_uint32(list.iol_data[i], ISNS_TAG_REGISTRATION_PERIOD, &period)) gState.granted = period;
     }
     isns_object_list_destroy(&list);
-    isns_simple_free(reply);
+}
+
+// Registers one target, joined to each portal of the entity: the node with its own
+// portals and groups first, then the groups that name the other portals "not through
+// here", in as many messages as they need.  Between the first message and the last the
+// server may join the node to portals not yet named by default (tag 1): right for its
+// own portals, and undone by the later messages for the others.
+uint32_t SendRegistration(Session &ses, const Settings &s, const ORLOiSCSITarget &t, const std::set<Portal> &own,
+                          const std::set<Portal> &all) {
+    const size_t fixed = 12 + 2 * StringAttr(t.iqn) + 2 * StringAttr(s.entity.c_str()) + 3 * AttrSize(4) + 8;
+    const size_t nodeSize = StringAttr(t.iqn) + AttrSize(4) + StringAttr(t.name);
+    const size_t pairSize = 2 * AttrSize(16) + 3 * AttrSize(4) + StringAttr(t.iqn);
+    // Own portals first: the first message always carries the node and those.
+    std::vector<const Portal *> order;
+    for (const Portal &p : own) order.push_back(&p);
+    for (const Portal &p : all)
+        if (own.count(p) == 0) order.push_back(&p);
+    size_t next = 0;
+    bool first = true;
+    while (first || next < order.size()) {
+        Objects objs;
+        isns_object_t *entity = objs.Keep(isns_create_entity(ISNS_ENTITY_PROTOCOL_ISCSI, s.entity.c_str()));
+        isns_object_set_uint32(entity, ISNS_TAG_REGISTRATION_PERIOD, static_cast<uint32_t>(s.period));
+        SourceGuard src(t.iqn);
+        isns_client_t client = {src.get(), ses.socket()};
+        isns_simple_t *msg = isns_create_registration(&client, entity);
+        isns_registration_add_object(msg, entity);
+        size_t size = fixed;
+        if (first) {
+            isns_object_t *node = objs.Keep(isns_create_iscsi_target(t.iqn, entity));
+            if (t.name[0] != '\0') isns_object_set_string(node, ISNS_TAG_ISCSI_ALIAS, t.name);
+            isns_registration_add_object(msg, node);
+            size += nodeSize;
+        }
+        size_t start = next;
+        // At least one pair per message (the largest names leave room for several).
+        while (next < order.size() && (size + pairSize <= kMessageBudget || next == start)) {
+            isns_registration_add_object(msg, objs.Keep(MakePortalObject(*order[next], entity)));
+            size += pairSize;
+            ++next;
+        }
+        for (size_t i = start; i < next; ++i)
+            isns_registration_add_object(msg,
+                                         objs.Keep(MakePortalGroup(t.iqn, *order[i], own.count(*order[i]) != 0)));
+        first = false;
+        isns_simple_t *reply = nullptr;
+        uint32_t ret = ses.Call(msg, &reply, "DevAttrReg", t.iqn);
+        if (ret != ORLO_OK) return ret;
+        NoteGranted(reply);
+        isns_simple_free(reply);
+    }
     return ORLO_OK;
 }
 

@@ -83,7 +83,8 @@ struct Object {
 
 inline std::vector<Object> ParseObjects(const std::string &out) {
     std::vector<Object> objs;
-    const std::regex head("^object\\[[0-9]+\\] = <(.*)>$");
+    // "object[N] = <Type>" (queries) or "Object N:" (lists, whose type is the listed one).
+    const std::regex head("^object\\[[0-9]+\\] = <(.*)>$|^Object [0-9]+:$");
     const std::regex attr("^\\s+[0-9a-f]{4}\\s+\\w+\\s+: (.*?) = (.*)$");
     size_t pos = 0;
     while (pos < out.size()) {
@@ -181,13 +182,12 @@ class IsnsServer {
         std::sort(out.begin(), out.end());
         return out;
     }
-    // A node's portal groups in the entity as "addr:port/tcp tag", sorted.
-    std::vector<std::string> PortalGroups(const std::string &iqn, const std::string &eid = kEntity) const {
+    // A node's portal groups as "addr:port/tcp tag", sorted.  Listed one group per
+    // request: an entity with many portals does not fit one answer.
+    std::vector<std::string> PortalGroups(const std::string &iqn) const {
         std::vector<std::string> out;
-        for (const Object &o : Entity(eid)) {
-            if (o.type != "iSCSI Portal Group" || o.attrs.count("Portal group name") == 0 ||
-                o.attrs.at("Portal group name") != iqn)
-                continue;
+        for (const Object &o : ParseObjects(Adm({"--list", "portal-groups"}))) {
+            if (o.attrs.count("Portal group name") == 0 || o.attrs.at("Portal group name") != iqn) continue;
             out.push_back(o.attrs.at("Portal group address") + ":" + o.attrs.at("Portal group port") + " " +
                           o.attrs.at("Portal group tag"));
         }
