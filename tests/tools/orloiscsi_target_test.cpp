@@ -405,7 +405,7 @@ TEST_F(OrloiscsiTarget, StatusAndSessionsFollowTheKernel) {
     const std::string iqn = IqnOf("t1");
     ASSERT_EQ(0, Cli({"--json", "target", "status", "t1"}, &out, &err)) << err;
     EXPECT_EQ("{\"tid\":1,\"name\":\"t1\",\"enabled\":true,\"status\":3,\"kernel\":\"running\",\"connection\":0,"
-              "\"connection_state\":\"no sessions\",\"sessions\":0}\n",
+              "\"connection_state\":\"no sessions\",\"sessions\":0,\"isns\":\"off\"}\n",
               out);
 
     ASSERT_EQ(0, AddSession(iqn, 1, kHost1, "192.0.2.7", 3));

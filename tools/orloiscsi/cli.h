@@ -196,6 +196,7 @@ void RegisterEp(CLI::App *root);
 void RegisterService(CLI::App *root);  // service, modules, selftest
 void RegisterConf(CLI::App *root);
 void RegisterErrstr(CLI::App *root);
+void RegisterIsns(CLI::App *root);
 void RegisterOverview(CLI::App *root);
 
 }  // namespace cli

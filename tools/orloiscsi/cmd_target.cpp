@@ -21,6 +21,7 @@
 #include <string>
 #include <vector>
 
+#include "base/iscsi_base_internal.h"
 #include "cli.h"
 #include "olibc.h"
 #include "orloiscsi_base.h"
@@ -649,6 +650,14 @@ int RunStatus(const std::string &ref) {
     ORLOiSCSISessionStateList list;
     int sessions = LoadSessions(r.t.tid, &list);
     ORLOiSCSITargetSessionStateListFree(&list);
+    // iSNS: off, or whether the server holds the target (a server that cannot be asked
+    // is reported, not a failure of the status).
+    bool isnsOn = ORLOiSCSIiSNSIsEnabled(), registered = false;
+    uint32_t isnsErr = isnsOn ? ORLOiSCSITargetiSNSIsRegistered(&r.t, &registered) : 0;
+    std::string isns = !isnsOn ? "off"
+                       : isnsErr != 0 ? "unknown (" + std::to_string(isnsErr) + " " + ORLOiSCSIErrStr(isnsErr) + ")"
+                       : registered ? "registered"
+                                    : "not registered";
     if (Ctx().json) {
         PrintJson(Json::Object()
                       .SetInt("tid", r.t.tid)
@@ -658,7 +667,8 @@ int RunStatus(const std::string &ref) {
                       .SetStr("kernel", KernelState(status))
                       .SetInt("connection", conn)
                       .SetStr("connection_state", ConnectionName(conn))
-                      .SetInt("sessions", sessions));
+                      .SetInt("sessions", sessions)
+                      .SetStr("isns", isns));
         return 0;
     }
     printf("target %d '%s' %s\n", r.t.tid, r.t.name, r.t.iqn);
@@ -669,6 +679,7 @@ int RunStatus(const std::string &ref) {
         printf("  sessions:   %d\n", sessions);
     else
         printf("  sessions:   unknown\n");
+    printf("  iSNS:       %s\n", isns.c_str());
     return 0;
 }
 

@@ -111,6 +111,7 @@ int main(int argc, char **argv) {
     RegisterAcl(&app);
     RegisterEp(&app);
     RegisterService(&app);
+    RegisterIsns(&app);
     RegisterConf(&app);
     RegisterErrstr(&app);
 
