@@ -548,6 +548,18 @@ ORLO_EXPORT int CommRecvEvlp(PORLOCOMM handle, PORLOCOMM_EVLP e) {
     return static_cast<int>(reinterpret_cast<ORLOCOMM_DATA_MSG *>(e->buf)->length);
 }
 
+ORLO_EXPORT int CommRecvEvlpTimed(PORLOCOMM handle, PORLOCOMM_EVLP e, int timeout_ms) {
+    if (handle == nullptr || EvlpBuf(e) == nullptr) {
+        COMM_ERR("Invalid parameter");
+        return -1;
+    }
+    uint8_t buf[ORLOCOMM_MSG_BUF_SIZE];
+    int n = AppRecvMessageTimed(handle->app, buf, sizeof(buf), timeout_ms);
+    if (n < 1) return n;
+    memcpy(e->buf, buf, sizeof(buf));
+    return static_cast<int>(reinterpret_cast<ORLOCOMM_DATA_MSG *>(e->buf)->length);
+}
+
 ORLO_EXPORT void *CommGetEvlpData(PORLOCOMM_EVLP e) {
     uint8_t *buf = EvlpBuf(e);
     if (buf == nullptr || buf[0] == 0) return nullptr;

@@ -152,14 +152,12 @@ ORLO_EXPORT int DetachAppChannel(ORLOCOMM_APP *app) {
 ORLO_EXPORT int CloseAppChannel(ORLOCOMM_APP *app) {
     if (app == nullptr || app->channel == nullptr) return -1;
     ORLOCOMM_CHANNEL *ch = app->channel;
-    // Only a channel the app owns leaves the set; a remote app shares its host's channel.
-    if (app->type == ORLOCOMM_APP_LOCAL && ch->desc->kind != 0 && pChannelSet != nullptr) {
-        RemoveChannel(pChannelSet, ch);
-        app->channel = nullptr;
-        ChannelFree(ch);
-        return 0;
-    }
-    return DetachAppChannel(app);
+    // A local app owns its channel; a remote app shares its host's and only lets go of it.
+    if (app->type != ORLOCOMM_APP_LOCAL) return DetachAppChannel(app);
+    if (ch->desc->kind != 0 && pChannelSet != nullptr) RemoveChannel(pChannelSet, ch);
+    app->channel = nullptr;
+    ChannelFree(ch);
+    return 0;
 }
 
 ORLO_EXPORT int AddAppRouteRule(ORLOCOMM_APP *app, ORLOCOMM_APP *peer) {

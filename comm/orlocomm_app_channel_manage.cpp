@@ -437,13 +437,17 @@ ORLO_EXPORT int AppUSendMessage(ORLOCOMM_APP *app, const char *to_uuid, const vo
 
 // The next data message (its whole length), or EnCryptBrokenAppFD(index) when a route
 // broke, or -1 when the engine stopped or went away.
-ORLO_EXPORT int AppRecvMessage(ORLOCOMM_APP *app, void *buf, int size) {
+ORLO_EXPORT int AppRecvMessage(ORLOCOMM_APP *app, void *buf, int size) { return AppRecvMessageTimed(app, buf, size, -1); }
+
+ORLO_EXPORT int AppRecvMessageTimed(ORLOCOMM_APP *app, void *buf, int size, int timeout_ms) {
     if (app == nullptr || buf == nullptr || size <= 0) {
         COMM_ERR("Invalid parameter");
         return -1;
     }
     uint8_t msg[ORLOCOMM_MSG_BUF_SIZE];
-    for (;;) {
+    int64_t deadline = timeout_ms < 0 ? 0 : orlocomm::NowMs() + timeout_ms;
+    for (bool first = true;; first = false) {
+        if (!first && timeout_ms >= 0 && orlocomm::NowMs() >= deadline) return 0;
         {
             MutexGuard g(&app->queue_mutex);
             if (app->control_count < 0 || app->data_count < 0)
@@ -468,7 +472,12 @@ ORLO_EXPORT int AppRecvMessage(ORLOCOMM_APP *app, void *buf, int size) {
             }
         }
         if (app->stopped) return -1;
-        int n = orlocomm::AppReadOne(app, msg, sizeof(msg), kReadSliceMs);
+        int slice = kReadSliceMs;
+        if (timeout_ms >= 0) {
+            int64_t left = deadline - orlocomm::NowMs();
+            slice = left < 0 ? 0 : (left < slice ? static_cast<int>(left) : slice);
+        }
+        int n = orlocomm::AppReadOne(app, msg, sizeof(msg), slice);
         if (n < 0) return -1;
         if (n == 0) continue;
         if (IsData(msg[0])) {

@@ -19,8 +19,6 @@
 // and LOG_ERR for failures.  A line whose priority the program masked out is not formatted.
 extern std::atomic<int> gOrloCommLogMask;
 inline bool OrloCommLogOn(int prio) { return (gOrloCommLogMask.load(std::memory_order_relaxed) & LOG_MASK(prio)) != 0; }
-// Sets the priorities the engine formats and logs (a syslog mask, LOG_UPTO(...)).
-extern "C" ORLO_EXPORT void OrloCommSetLogMask(int mask);
 
 #define COMM_LOG(prio, fmt, ...)                                                                     \
     do {                                                                                             \

@@ -431,6 +431,11 @@ ORLO_EXPORT extern char gszLocalActiveIP[64];
 ORLO_EXPORT extern pthread_mutex_t mCommMutex;
 ORLO_EXPORT extern pthread_once_t once_block;
 
+/* The priorities (a syslog mask, LOG_UPTO(...)) of the engine's lines that are formatted
+ * and logged at all; all of them by default.  A program that masks its info lines sets this
+ * too, so that masked lines cost nothing. */
+ORLO_EXPORT void OrloCommSetLogMask(int mask);
+
 /* ---- Service identifiers (orlocomm_types) ---- */
 ORLO_EXPORT int ServiceUUIDGenerate(const char *name, int owner, char *dst, size_t n);
 ORLO_EXPORT int ServiceIDGenerateUUID(ServiceID *id);
@@ -587,6 +592,8 @@ ORLO_EXPORT int AppWaitControl(ORLOCOMM_APP *app, void *buf, int size, ORLOCOMM_
 ORLO_EXPORT int AppSendMessage(ORLOCOMM_APP *app, int index, const void *data, int len);
 ORLO_EXPORT int AppUSendMessage(ORLOCOMM_APP *app, const char *to_uuid, const void *data, int len);
 ORLO_EXPORT int AppRecvMessage(ORLOCOMM_APP *app, void *buf, int size);
+/* As AppRecvMessage, waiting at most timeout_ms (-1: for ever); 0 when nothing came. */
+ORLO_EXPORT int AppRecvMessageTimed(ORLOCOMM_APP *app, void *buf, int size, int timeout_ms);
 ORLO_EXPORT int AppRetMessage(ORLOCOMM_APP *app, void *msg, const void *data, int len);
 ORLO_EXPORT int AppGetMessageFromFD(ORLOCOMM_APP *app, const void *msg);
 ORLO_EXPORT int AppConnect(ORLOCOMM_APP *app, const char *host, const char *service);
@@ -692,6 +699,9 @@ ORLO_EXPORT PORLOCOMM_EVLP CreateOrloCommEvlp(void);
 ORLO_EXPORT void FreeOrloCommEvlpData(PORLOCOMM_EVLP e);
 ORLO_EXPORT void ReleaseOrloCommEvlp(PORLOCOMM_EVLP e);
 ORLO_EXPORT int CommRecvEvlp(PORLOCOMM handle, PORLOCOMM_EVLP e);
+/* As CommRecvEvlp, waiting at most timeout_ms; 0 when nothing came (the envelope is then
+ * left as it was). */
+ORLO_EXPORT int CommRecvEvlpTimed(PORLOCOMM handle, PORLOCOMM_EVLP e, int timeout_ms);
 ORLO_EXPORT void *CommGetEvlpData(PORLOCOMM_EVLP e);
 ORLO_EXPORT int CommRetEvlp(PORLOCOMM handle, PORLOCOMM_EVLP e, const void *data, int len);
 ORLO_EXPORT int CommGetEvlpDataLen(PORLOCOMM_EVLP e);
