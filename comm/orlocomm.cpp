@@ -129,6 +129,25 @@ void ClearMediumFrame(void *m, bool pipe) {
 
 namespace orlocomm {
 
+std::atomic<int> gControlWaitMs{kControlWaitMs};
+
+void RefreshLocalHost() {
+    ORLOCOMM_HOST *local = EnsureLocalHost();
+    if (local == nullptr) return;
+    uint32_t ips[ORLOCOMM_MAX_HOST_IPS];
+    char active[64];
+    int n = EnumAllAdapterIPs(ips, ORLOCOMM_MAX_HOST_IPS, active, sizeof(active));
+    if (n <= 0) return;
+    std::lock_guard<std::mutex> l(gLocalHostMu);
+    MutexGuard g(&local->mutex);
+    memcpy(local->ips, ips, sizeof(uint32_t) * static_cast<size_t>(n));
+    local->ip_count = n;
+    if (strcmp(active, gszLocalActiveIP) != 0) {
+        snprintf(gszLocalActiveIP, sizeof(gszLocalActiveIP), "%s", active);
+        COMM_INFO(">>>>> Init 1st Active IP %s", gszLocalActiveIP);
+    }
+}
+
 int EnsureInit() {
     if (pthread_once(&once_block, OnceInit) != 0) {
         COMM_ERR("once_init fail");
@@ -385,6 +404,7 @@ ORLO_EXPORT int InitOrloComm(PORLOCOMM handle, const char *name) {
         return -1;
     }
     if (orlocomm::EnsureLocalHost() == nullptr) return -1;
+    orlocomm::RefreshLocalHost();
     int owner = static_cast<int>(getpid());
     // One process, several applications: the second and later get a service number.
     char path[4096];
@@ -592,6 +612,7 @@ ORLO_EXPORT int CommGetEvlpFD(PORLOCOMM handle, PORLOCOMM_EVLP e) {
 
 ORLO_EXPORT ORLOCOMM_ENG *CreateEngComm(void) {
     if (orlocomm::EnsureLocalHost() == nullptr) return nullptr;
+    orlocomm::RefreshLocalHost();
     auto *eng = static_cast<ORLOCOMM_ENG *>(calloc(1, sizeof(ORLOCOMM_ENG)));
     if (eng == nullptr) {
         COMM_ERR("Out of memory");

@@ -353,7 +353,8 @@ ORLO_EXPORT int AppWaitControl(ORLOCOMM_APP *app, void *buf, int size, ORLOCOMM_
         COMM_ERR("Invalid parameter");
         return -1;
     }
-    int64_t deadline = orlocomm::NowMs() + orlocomm::kControlWaitMs;
+    int wait = orlocomm::gControlWaitMs.load();
+    int64_t deadline = orlocomm::NowMs() + wait;
     uint8_t msg[ORLOCOMM_MSG_BUF_SIZE];
     for (;;) {
         {
@@ -370,7 +371,7 @@ ORLO_EXPORT int AppWaitControl(ORLOCOMM_APP *app, void *buf, int size, ORLOCOMM_
         }
         if (app->stopped) return -1;
         if (orlocomm::NowMs() >= deadline) {
-            COMM_ERR("%s: no answer within %d ms", app->id.uuid, orlocomm::kControlWaitMs);
+            COMM_ERR("%s: no answer within %d ms", app->id.uuid, wait);
             return -1;
         }
         int n = orlocomm::AppReadOne(app, msg, sizeof(msg), kReadSliceMs);

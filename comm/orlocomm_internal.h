@@ -49,6 +49,8 @@ constexpr int kPipeFrameTimeoutMs = 2000; // the rest of a started frame on a FI
 constexpr int kFirstFrameTimeoutMs = 10000;  // a new TCP connection must say Conn by then
 constexpr int kWriteTimeoutMs = 10000;    // a frame must be taken by the reader by then
 constexpr int kControlWaitMs = 30000;     // an application waits this long for an answer
+// The wait for an answer in force (kControlWaitMs unless a test shortened it).
+extern std::atomic<int> gControlWaitMs;
 constexpr int kRConnectSleepSec = 2;
 
 // ---- Intrusive circular lists ----
@@ -102,6 +104,9 @@ uint8_t *NewZeroed(size_t size);
 int EnsureInit();
 // The local host record, made on first use from the globals.
 ORLOCOMM_HOST *EnsureLocalHost();
+// Reads the appliance's addresses again into the local host record and gszLocalActiveIP
+// (an application that joins, or an engine that starts, sees the network as it is now).
+void RefreshLocalHost();
 
 // ---- Channels ----
 // The medium a channel sends on and the one it receives on (by its end).
