@@ -174,6 +174,31 @@ TEST_F(EngineTest, InitWaitsTwelveSecondsForAnEngineThatIsNotThere) {
     EXPECT_EQ(InitOrloComm(nullptr, "x"), -1);
 }
 
+TEST_F(EngineTest, ConnectingToAHostThatNeverAnswersGivesUpAfterTenSeconds) {
+    // Packets to 10.55.0.2 leave by a veth without ARP whose other end holds no address:
+    // they vanish, with neither an answer nor an error.
+    for (const std::vector<std::string> &cmd : std::vector<std::vector<std::string>>{
+             {"/usr/sbin/ip", "link", "add", "ocx0", "type", "veth", "peer", "name", "ocx1"},
+             {"/usr/sbin/ip", "addr", "add", "10.55.0.1/24", "dev", "ocx0"},
+             {"/usr/sbin/ip", "link", "set", "ocx0", "arp", "off"},
+             {"/usr/sbin/ip", "link", "set", "ocx0", "up"},
+             {"/usr/sbin/ip", "link", "set", "ocx1", "up"}})
+        ASSERT_EQ(orlotest::RunProgram(cmd), 0) << cmd[1];
+    PORLOCOMM cli = CreateOrloComm("patient");
+    ASSERT_NE(cli, nullptr);
+    int status = 0;
+    int64_t start = orlocomm::NowMs();
+    EXPECT_EQ(AppPing(cli->app, "10.55.0.2", "anything", &status), 0);
+    int64_t waited = orlocomm::NowMs() - start;
+    EXPECT_EQ(status, ORLOCOMM_PONG_UNREACHABLE);
+    EXPECT_GE(waited, 9500);
+    EXPECT_LT(waited, 20000);
+    EXPECT_TRUE(EngineLogged("Try to connect ip 10.55.0.2"));
+    EXPECT_TRUE(EngineLogged("Connect InProgress"));
+    EXPECT_TRUE(EngineLogged("Connect Failed, Timeout or 110 - Connection timed out")) << EngineLog();
+    EXPECT_EQ(DestroyOrloComm(cli), 0);
+}
+
 TEST_F(EngineTest, TheCountFileAdmitsTwoClientsAndAThirdWaits) {
     PORLOCOMM one = CreateOrloComm("one");
     PORLOCOMM two = CreateOrloComm("two");
