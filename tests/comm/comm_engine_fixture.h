@@ -87,7 +87,7 @@ inline std::string Slurp(const std::string &path) {
     return ss.str();
 }
 
-class EngineTest : public orlotest::SandboxTest {
+class CommEngineTest : public orlotest::SandboxTest {
   protected:
     void SetUp() override {
         if (geteuid() != 0) GTEST_SKIP() << "needs root: every engine gets a network namespace of its own";

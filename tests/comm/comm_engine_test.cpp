@@ -11,13 +11,13 @@
 
 namespace {
 
-using commtest::EngineTest;
+using commtest::CommEngineTest;
 
 const ORLOCOMM_DATA_MSG *AsData(const std::vector<uint8_t> &b) {
     return reinterpret_cast<const ORLOCOMM_DATA_MSG *>(b.data());
 }
 
-TEST_F(EngineTest, ServicesRegisterConnectAndExchangeThroughTheEngine) {
+TEST_F(CommEngineTest, ServicesRegisterConnectAndExchangeThroughTheEngine) {
     PORLOCOMM svc = CreateOrloComm("echo");
     ASSERT_NE(svc, nullptr) << log_.Dump();
     PORLOCOMM cli = CreateOrloComm("client");
@@ -101,7 +101,7 @@ TEST_F(EngineTest, ServicesRegisterConnectAndExchangeThroughTheEngine) {
     EXPECT_EQ(CreateOrloComm(nullptr), nullptr);
 }
 
-TEST_F(EngineTest, AServiceThatLeavesOrDiesBreaksItsClientsRoutes) {
+TEST_F(CommEngineTest, AServiceThatLeavesOrDiesBreaksItsClientsRoutes) {
     PORLOCOMM svc = CreateOrloComm("leaving");
     PORLOCOMM cli = CreateOrloComm("staying");
     ASSERT_NE(svc, nullptr);
@@ -134,7 +134,7 @@ TEST_F(EngineTest, AServiceThatLeavesOrDiesBreaksItsClientsRoutes) {
     EXPECT_EQ(CountValue(), 1);
 }
 
-TEST_F(EngineTest, ACleanStopTellsEveryAppAndRemovesTheEngineFiles) {
+TEST_F(CommEngineTest, ACleanStopTellsEveryAppAndRemovesTheEngineFiles) {
     PORLOCOMM cli = CreateOrloComm("listener");
     ASSERT_NE(cli, nullptr);
     EXPECT_TRUE(Exists(ORLOCOMM_PIPE_SVR_MSG_REQ));
@@ -161,7 +161,7 @@ TEST_F(EngineTest, ACleanStopTellsEveryAppAndRemovesTheEngineFiles) {
     EXPECT_LT(orlocomm::NowMs() - start, 5000);
 }
 
-TEST_F(EngineTest, InitWaitsTwelveSecondsForAnEngineThatIsNotThere) {
+TEST_F(CommEngineTest, InitWaitsTwelveSecondsForAnEngineThatIsNotThere) {
     ASSERT_EQ(StopEngine(), 0);
     ORLOCOMM handle = {nullptr};
     int64_t start = orlocomm::NowMs();
@@ -174,7 +174,7 @@ TEST_F(EngineTest, InitWaitsTwelveSecondsForAnEngineThatIsNotThere) {
     EXPECT_EQ(InitOrloComm(nullptr, "x"), -1);
 }
 
-TEST_F(EngineTest, ConnectingToAHostThatNeverAnswersGivesUpAfterTenSeconds) {
+TEST_F(CommEngineTest, ConnectingToAHostThatNeverAnswersGivesUpAfterTenSeconds) {
     // Packets to 10.55.0.2 leave by a veth without ARP whose other end holds no address:
     // they vanish, with neither an answer nor an error.
     for (const std::vector<std::string> &cmd : std::vector<std::vector<std::string>>{
@@ -199,7 +199,7 @@ TEST_F(EngineTest, ConnectingToAHostThatNeverAnswersGivesUpAfterTenSeconds) {
     EXPECT_EQ(DestroyOrloComm(cli), 0);
 }
 
-TEST_F(EngineTest, TheCountFileAdmitsTwoClientsAndAThirdWaits) {
+TEST_F(CommEngineTest, TheCountFileAdmitsTwoClientsAndAThirdWaits) {
     PORLOCOMM one = CreateOrloComm("one");
     PORLOCOMM two = CreateOrloComm("two");
     ASSERT_NE(one, nullptr);

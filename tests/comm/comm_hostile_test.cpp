@@ -16,7 +16,7 @@
 
 namespace {
 
-using commtest::EngineTest;
+using commtest::CommEngineTest;
 
 const uint8_t kMagic[8] = {0x12, 0x18, 0x0D, 0x0E, 0x0B, 0x0E, 0x06, 0x18};
 
@@ -94,7 +94,7 @@ std::string ConnMsg(uint8_t major, uint32_t src_ip, const char *name) {
     return std::string(reinterpret_cast<const char *>(&m), sizeof(m));
 }
 
-TEST_F(EngineTest, AnotherMajorVersionIsRejectedExceptForConn) {
+TEST_F(CommEngineTest, AnotherMajorVersionIsRejectedExceptForConn) {
     const int owner = 555555;
     std::string rep = Real("/tmp/orlocomm_pipe_rep_555555");
     ASSERT_EQ(mkfifo(rep.c_str(), 0620), 0);
@@ -256,7 +256,7 @@ std::string Hostile(std::mt19937 &rng, const std::vector<std::string> &templates
     }
 }
 
-TEST_F(EngineTest, TenThousandHostileFramesLeaveTheEngineAnsweringPings) {
+TEST_F(CommEngineTest, TenThousandHostileFramesLeaveTheEngineAnsweringPings) {
     orlocomm::gControlWaitMs.store(3000);
     PORLOCOMM target = CreateOrloComm("target");
     PORLOCOMM pinger = CreateOrloComm("pinger");

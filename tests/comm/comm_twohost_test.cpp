@@ -17,7 +17,7 @@ using commtest::WaitExit;
 
 const char *kIp = "/usr/sbin/ip";
 
-class TwoHostTest : public ::testing::Test {
+class CommTwoHostTest : public ::testing::Test {
   protected:
     struct Host {
         std::string ns, veth, addr, root;
@@ -138,7 +138,7 @@ class TwoHostTest : public ::testing::Test {
     std::vector<pid_t> helpers_;
 };
 
-TEST_F(TwoHostTest, TenThousandCheckedMessagesEachWayAndEveryPingAnswer) {
+TEST_F(CommTwoHostTest, TenThousandCheckedMessagesEachWayAndEveryPingAnswer) {
     pid_t echo = Serve(b_, "echo", "echo.log");
     ASSERT_TRUE(AwaitLog(b_, "engine.log", "Adopt echo-", 10000)) << Slurp(b_.root + "/echo.log");
     std::string out;
@@ -171,7 +171,7 @@ TEST_F(TwoHostTest, TenThousandCheckedMessagesEachWayAndEveryPingAnswer) {
     EXPECT_NE(Slurp(b_.root + "/echo.log").find("engine gone"), std::string::npos);
 }
 
-TEST_F(TwoHostTest, AKilledEngineBreaksTheRoutesAndARestartedOneServesAgain) {
+TEST_F(CommTwoHostTest, AKilledEngineBreaksTheRoutesAndARestartedOneServesAgain) {
     pid_t echo = Serve(b_, "echo", "echo.log");
     ASSERT_TRUE(AwaitLog(b_, "engine.log", "Adopt echo-", 10000));
     std::string progress = a_.root + "/progress";
