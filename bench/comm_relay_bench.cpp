@@ -440,7 +440,7 @@ class Summary : public benchmark::ConsoleReporter {
   private:
     void Line(const char *what, const std::string &e, const std::string &b, const char *unit) {
         if (!times_.count(e) || !times_.count(b)) return;
-        double te = times_[e] / 1000.0, tb = times_[b] / 1000.0;
+        double te = times_[e], tb = times_[b];
         printf("%-34s %9.1f %s %9.1f %s %7.2fx\n", what, te, unit, tb, unit, te / tb);
     }
     void Rate(const char *what, const std::string &e, const std::string &b) {

@@ -189,10 +189,13 @@ int ChannelWaitReadable(ORLOCOMM_CHANNEL *ch, int timeoutMs) {
     void *m = RecvMedium(ch);
     if (m == nullptr) return -1;
     int fd;
-    if (IsPipeChannel(ch))
-        fd = static_cast<ORLOCOMM_PIPE *>(m)->read_fd;
-    else {
+    if (IsPipeChannel(ch)) {
+        auto *p = static_cast<ORLOCOMM_PIPE *>(m);
+        if (p->rbuf_off < p->rbuf_len) return 1;  // already read ahead
+        fd = p->read_fd;
+    } else {
         auto *s = static_cast<ORLOCOMM_SOCKET *>(m);
+        if (s->rbuf_off < s->rbuf_len) return 1;
         fd = s->conn_fd >= 0 ? s->conn_fd : s->sock_fd;
     }
     if (fd < 0) return -1;

@@ -389,6 +389,10 @@ ORLO_EXPORT int AppWaitControl(ORLOCOMM_APP *app, void *buf, int size, ORLOCOMM_
 // Takes in whatever already waits on the app's FIFO, so that a broken route is known
 // before anything is sent on it.
 static void DrainPending(ORLOCOMM_APP *app) {
+    // At most once a millisecond: a sender in a tight loop does not pay a poll per message.
+    int64_t now = orlocomm::NowMs();
+    if (__atomic_load_n(&app->last_drain_ms, __ATOMIC_RELAXED) == now) return;
+    __atomic_store_n(&app->last_drain_ms, now, __ATOMIC_RELAXED);
     uint8_t msg[ORLOCOMM_MSG_BUF_SIZE];
     for (int i = 0; i < orlocomm::kMaxQueued; ++i) {
         int n = orlocomm::AppReadOne(app, msg, sizeof(msg), 0);

@@ -12,6 +12,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <condition_variable>
 #include <cstdio>
@@ -388,6 +389,8 @@ ORLO_EXPORT int orlocomm_socket_write(void *media, const void *buf, int len) {
     return done > 0 ? done : -1;
 }
 
+// Reads exactly len bytes, keeping what came beyond them for the next read (one reader per
+// connection).
 ORLO_EXPORT int orlocomm_socket_read(void *media, void *buf, int len) {
     auto *s = static_cast<ORLOCOMM_SOCKET *>(media);
     if (s == nullptr || buf == nullptr || len <= 0) return -1;
@@ -397,6 +400,22 @@ ORLO_EXPORT int orlocomm_socket_read(void *media, void *buf, int len) {
     int got = 0;
     int64_t deadline = 0;
     while (got < len) {
+        if (s->rbuf_off < s->rbuf_len) {
+            int take = std::min(len - got, s->rbuf_len - s->rbuf_off);
+            memcpy(bytes + got, s->rbuf + s->rbuf_off, static_cast<size_t>(take));
+            s->rbuf_off += take;
+            got += take;
+            s->frame_started = 1;
+            continue;
+        }
+        s->rbuf_off = s->rbuf_len = 0;
+        ssize_t n = recv(fd, s->rbuf, sizeof(s->rbuf), MSG_DONTWAIT);
+        if (n > 0) {
+            s->rbuf_len = static_cast<int32_t>(n);
+            continue;
+        }
+        if (n < 0 && errno == EINTR) continue;
+        if (n == 0 || errno != EAGAIN) break;  // the peer closed or the connection failed
         int timeout = -1;
         if (s->frame_started) {
             if (deadline == 0) deadline = orlocomm::NowMs() + s->frame_timeout_ms;
@@ -405,14 +424,6 @@ ORLO_EXPORT int orlocomm_socket_read(void *media, void *buf, int len) {
             timeout = static_cast<int>(left);
         }
         if (WaitFd(fd, POLLIN, timeout) <= 0) break;
-        ssize_t n = recv(fd, bytes + got, static_cast<size_t>(len - got), 0);
-        if (n > 0) {
-            got += static_cast<int>(n);
-            s->frame_started = 1;
-            continue;
-        }
-        if (n < 0 && (errno == EINTR || errno == EAGAIN)) continue;
-        break;  // the peer closed or the connection failed
     }
     if (got < len) s->short_read = 1;
     return got;

@@ -125,6 +125,7 @@ ORLO_EXTERN_C_BEGIN
 #define ORLOCOMM_PIPE_SVR_CTL_REP "/tmp/orlocomm_pipe_svr_ctl_rep"
 #define ORLOCOMM_PIPE_SVR_MSG_REQ "/tmp/orlocomm_pipe_svr_msg_req"
 #define ORLOCOMM_PIPE_SVR_MSG_REP "/tmp/orlocomm_pipe_svr_msg_rep"
+#define ORLOCOMM_WRITE_LOCK_SUFFIX ".lock"  /* the writers' lock beside a shared FIFO */
 #define ORLOCOMM_PIPE_REQ_FMT "/tmp/orlocomm_pipe_req_%d"
 #define ORLOCOMM_PIPE_REP_FMT "/tmp/orlocomm_pipe_rep_%d"
 #define ORLOCOMM_FIFO_MODE 0620
@@ -333,10 +334,15 @@ typedef struct _tag_ORLOCOMM_PIPE {
     char path[4096];
     ORLOCOMM_CMD_PACKET queue;
     int32_t server;       /* made the FIFO and reads it (unlinks it when destroyed) */
-    int32_t shared;       /* several processes write it: writers take the FIFO's lock */
+    int32_t shared;       /* several processes write it: writers take the writers' lock */
+    void *write_lock;     /* that lock: a robust process-shared mutex mapped from a file beside
+                             the FIFO, or NULL, and then the FIFO's own flock */
     int32_t read_timeout_ms;  /* how long the rest of a started frame may take */
     int32_t frame_started;    /* a frame has begun: its rest is waited for read_timeout_ms */
     int32_t short_read;       /* the last frame came short (end of file, time-out, error) */
+    int32_t rbuf_len;         /* bytes read ahead of the frame being taken */
+    int32_t rbuf_off;
+    uint8_t rbuf[8192];
 } ORLOCOMM_PIPE;
 
 /* A socket medium. */
@@ -350,6 +356,9 @@ typedef struct _tag_ORLOCOMM_SOCKET {
     int32_t frame_timeout_ms;
     int32_t frame_started;
     int32_t short_read;
+    int32_t rbuf_len;
+    int32_t rbuf_off;
+    uint8_t rbuf[8192];
 } ORLOCOMM_SOCKET;
 
 typedef struct _tag_ORLOCOMM_CHANNEL_SET {
@@ -382,6 +391,7 @@ typedef struct _tag_ORLOCOMM_APP {
     int32_t comm_flags;
     pid_t engine_pid;
     int32_t stopped;
+    int64_t last_drain_ms;
 } ORLOCOMM_APP;
 
 typedef struct _tag_ORLOCOMM_RULE {
