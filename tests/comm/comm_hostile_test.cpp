@@ -329,7 +329,12 @@ TEST_F(CommEngineTest, TenThousandHostileFramesLeaveTheEngineAnsweringPings) {
     }
     EXPECT_TRUE(ping());
     long rss1 = commtest::RssKb(engine_);
+#ifdef __SANITIZE_ADDRESS__
+    // AddressSanitizer keeps freed memory in quarantine: resident size says nothing here.
+    (void)rss1;
+#else
     EXPECT_LT(rss1, 2 * rss0) << "resident memory grew from " << rss0 << " kB to " << rss1 << " kB";
+#endif
     RecordProperty("rss_start_kb", std::to_string(rss0));
     RecordProperty("rss_end_kb", std::to_string(rss1));
     printf("engine RSS %ld kB -> %ld kB; %d pings, %d retried; %d connections\n", rss0, rss1, pings, lost, connections);
