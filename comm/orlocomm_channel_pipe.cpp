@@ -1,17 +1,12 @@
 // The pipe transport: channels over FIFOs on one host.  The end that reads a FIFO makes it
 // (mode 0620) and keeps a second, write-only descriptor so that it never sees end of file;
 // the writing end opens it write-only.  The engine's request FIFO is written by every
-// application: each writer holds the writers' lock around a frame so that frames of
-// different writers never interleave, however full the pipe is.  The lock is a robust,
-// process-shared mutex in a small file beside the FIFO, made by the engine (taking it costs
-// no system call unless another writer holds it; a writer that died holding it leaves it
-// to the next); a writer that cannot map it locks the FIFO itself with flock.
+// application: each writer holds an exclusive flock on the FIFO around a frame so that
+// frames of different writers never interleave, however full the pipe is.
 #include <fcntl.h>
 #include <poll.h>
 #include <signal.h>
-#include <pthread.h>
 #include <sys/file.h>
-#include <sys/mman.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -47,76 +42,18 @@ void ClosePipe(ORLOCOMM_PIPE *p) {
     if (p->read_fd >= 0) close(p->read_fd);
     if (p->write_fd >= 0) close(p->write_fd);
     p->read_fd = p->write_fd = -1;
-    if (p->write_lock != nullptr) munmap(p->write_lock, sizeof(pthread_mutex_t));
-    p->write_lock = nullptr;
 }
 
-std::string LockPath(const char *fifo) { return std::string(fifo) + ORLOCOMM_WRITE_LOCK_SUFFIX; }
-
-// The engine's side: a fresh lock file, initialised under a temporary name and renamed into
-// place, so that a writer never maps a half-made mutex.
-void MakeWriterLock(const char *fifo) {
-    std::string path = LockPath(fifo);
-    std::string tmpl = path + ".XXXXXX";
-    std::vector<char> name(tmpl.begin(), tmpl.end());
-    name.push_back('\0');
-    int fd = orlo::os::Mkstemp(name.data());
-    if (fd < 0) {
-        COMM_ERR("mkstemp(\"%s\") failed, err=%m", name.data());
-        return;
-    }
-    bool ok = ftruncate(fd, sizeof(pthread_mutex_t)) == 0 && fchmod(fd, 0660) == 0;
-    void *m = ok ? mmap(nullptr, sizeof(pthread_mutex_t), PROT_READ | PROT_WRITE, MAP_SHARED, fd, 0) : MAP_FAILED;
-    close(fd);
-    if (m != MAP_FAILED) {
-        pthread_mutexattr_t attr;
-        pthread_mutexattr_init(&attr);
-        pthread_mutexattr_setpshared(&attr, PTHREAD_PROCESS_SHARED);
-        pthread_mutexattr_setrobust(&attr, PTHREAD_MUTEX_ROBUST);
-        ok = pthread_mutex_init(static_cast<pthread_mutex_t *>(m), &attr) == 0;
-        pthread_mutexattr_destroy(&attr);
-        munmap(m, sizeof(pthread_mutex_t));
-    } else {
-        ok = false;
-    }
-    if (!ok || orlo::os::Rename(name.data(), path.c_str()) != 0) {
-        COMM_ERR("Fail to make the writers' lock %s, err=%m", path.c_str());
-        orlo::os::Unlink(name.data());
-    }
-}
-
-void *MapWriterLock(const char *fifo) {
-    std::string path = LockPath(fifo);
-    int fd = orlo::os::Open(path.c_str(), O_RDWR | O_NOFOLLOW | O_CLOEXEC);
-    if (fd < 0) return nullptr;
-    struct stat st;
-    void *m = MAP_FAILED;
-    if (fstat(fd, &st) == 0 && S_ISREG(st.st_mode) && st.st_size >= static_cast<off_t>(sizeof(pthread_mutex_t)))
-        m = mmap(nullptr, sizeof(pthread_mutex_t), PROT_READ | PROT_WRITE, MAP_SHARED, fd, 0);
-    close(fd);
-    return m == MAP_FAILED ? nullptr : m;
-}
-
+// Frames can be larger than the pipe's atomic write size, so writers of the shared request
+// FIFO take an exclusive flock on the FIFO around each frame: frames of different
+// applications never interleave.  Processes coordinate through lock files, never through
+// shared memory; the kernel drops the lock of a writer that dies.
 void LockWriters(ORLOCOMM_PIPE *p) {
-    if (p->write_lock != nullptr) {
-        auto *m = static_cast<pthread_mutex_t *>(p->write_lock);
-        int r = pthread_mutex_lock(m);
-        if (r == EOWNERDEAD) pthread_mutex_consistent(m);  // its holder died: the lock goes on
-        if (r == 0 || r == EOWNERDEAD) return;
-        COMM_ERR("The writers' lock of %s failed (%d): the FIFO is locked instead", p->path, r);
-        munmap(p->write_lock, sizeof(pthread_mutex_t));
-        p->write_lock = nullptr;
-    }
     while (flock(p->write_fd, LOCK_EX) != 0 && errno == EINTR) {
     }
 }
 
-void UnlockWriters(ORLOCOMM_PIPE *p) {
-    if (p->write_lock != nullptr)
-        pthread_mutex_unlock(static_cast<pthread_mutex_t *>(p->write_lock));
-    else
-        flock(p->write_fd, LOCK_UN);
-}
+void UnlockWriters(ORLOCOMM_PIPE *p) { flock(p->write_fd, LOCK_UN); }
 
 bool IsFifo(int fd, const char *path) {
     struct stat st;
@@ -183,13 +120,7 @@ ORLOCOMM_PIPE *OpenPipe(ORLOCOMM_CHANNEL *ch, bool request) {
     // Requests are read by the server end, responses by the client end.
     bool reader = request == (ch->desc->end == ORLOCOMM_SERVER_END);
     ORLOCOMM_PIPE *p = reader ? OpenServerPipe(path) : OpenClientPipe(path);
-    if (p != nullptr && request && ch->desc->id.owner < 0) {
-        p->shared = 1;
-        if (reader)
-            MakeWriterLock(path);
-        else
-            p->write_lock = MapWriterLock(path);
-    }
+    if (p != nullptr && request && ch->desc->id.owner < 0) p->shared = 1;
     return p;
 }
 
@@ -252,7 +183,6 @@ ORLO_EXPORT int orlocomm_pipe_stop_service(ORLOCOMM_CHANNEL *ch) {
         if (open && p->server) {
             COMM_INFO(">>>>>>>>>>>>>>>>>>>>> unlink %s", p->path);
             if (orlo::os::Unlink(p->path) != 0 && errno != ENOENT) COMM_ERR("unlink(\"%s\") failed, err=%m", p->path);
-            if (p->shared) orlo::os::Unlink(LockPath(p->path).c_str());
         }
     }
     return 0;

@@ -125,7 +125,6 @@ ORLO_EXTERN_C_BEGIN
 #define ORLOCOMM_PIPE_SVR_CTL_REP "/tmp/orlocomm_pipe_svr_ctl_rep"
 #define ORLOCOMM_PIPE_SVR_MSG_REQ "/tmp/orlocomm_pipe_svr_msg_req"
 #define ORLOCOMM_PIPE_SVR_MSG_REP "/tmp/orlocomm_pipe_svr_msg_rep"
-#define ORLOCOMM_WRITE_LOCK_SUFFIX ".lock"  /* the writers' lock beside a shared FIFO */
 #define ORLOCOMM_PIPE_REQ_FMT "/tmp/orlocomm_pipe_req_%d"
 #define ORLOCOMM_PIPE_REP_FMT "/tmp/orlocomm_pipe_rep_%d"
 #define ORLOCOMM_FIFO_MODE 0620
@@ -334,9 +333,7 @@ typedef struct _tag_ORLOCOMM_PIPE {
     char path[4096];
     ORLOCOMM_CMD_PACKET queue;
     int32_t server;       /* made the FIFO and reads it (unlinks it when destroyed) */
-    int32_t shared;       /* several processes write it: writers take the writers' lock */
-    void *write_lock;     /* that lock: a robust process-shared mutex mapped from a file beside
-                             the FIFO, or NULL, and then the FIFO's own flock */
+    int32_t shared;       /* several processes write it: writers flock the FIFO around a frame */
     int32_t read_timeout_ms;  /* how long the rest of a started frame may take */
     int32_t frame_started;    /* a frame has begun: its rest is waited for read_timeout_ms */
     int32_t short_read;       /* the last frame came short (end of file, time-out, error) */

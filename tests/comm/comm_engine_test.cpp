@@ -138,8 +138,7 @@ TEST_F(CommEngineTest, ACleanStopTellsEveryAppAndRemovesTheEngineFiles) {
     PORLOCOMM cli = CreateOrloComm("listener");
     ASSERT_NE(cli, nullptr);
     EXPECT_TRUE(Exists(ORLOCOMM_PIPE_SVR_MSG_REQ));
-    EXPECT_TRUE(Exists(ORLOCOMM_PIPE_SVR_MSG_REQ ORLOCOMM_WRITE_LOCK_SUFFIX));
-    EXPECT_NE(static_cast<ORLOCOMM_PIPE *>(cli->app->channel->request)->write_lock, nullptr);
+    EXPECT_TRUE(static_cast<ORLOCOMM_PIPE *>(cli->app->channel->request)->shared);
     EXPECT_EQ(ReadFile(ORLOCOMM_PID_FILE), std::to_string(engine_) + "\n");
     std::atomic<int> got{1};
     std::thread reader([&] {
@@ -151,7 +150,6 @@ TEST_F(CommEngineTest, ACleanStopTellsEveryAppAndRemovesTheEngineFiles) {
     reader.join();
     EXPECT_EQ(got.load(), -1);
     EXPECT_FALSE(Exists(ORLOCOMM_PIPE_SVR_MSG_REQ));
-    EXPECT_FALSE(Exists(ORLOCOMM_PIPE_SVR_MSG_REQ ORLOCOMM_WRITE_LOCK_SUFFIX));
     EXPECT_FALSE(Exists(ORLOCOMM_PID_FILE));
     std::string log = EngineLog();
     for (const char *line : {"Send service stop to PRqRx thread .......", ">>>>> STOP SERVICE",
