@@ -15,7 +15,7 @@ set -uo pipefail
 
 here=$(cd "$(dirname "$0")/../.." && pwd)
 BIN=$(cd "${1:-$here/build/bin}" 2>/dev/null && pwd) || { echo "orlo-demo: no build directory ${1:-$here/build/bin}; run 'make build' first" >&2; exit 1; }
-for p in orloiscsi orlo-configfs-sim orlo-sim-insmod; do
+for p in orloiscsi orlo-configfs-sim orlo-sim-insmod orlocommd orlocomm-cat; do
     [ -x "$BIN/$p" ] || { echo "orlo-demo: $BIN/$p is missing; run 'make build' first" >&2; exit 1; }
 done
 if [ "$(id -u)" != 0 ]; then
@@ -26,6 +26,7 @@ export PATH="$BIN:$PATH"
 
 ROOT=""
 SIM_PID=""
+CAT_PID=""
 STEP=0
 FAILED=""
 
@@ -63,13 +64,16 @@ step() {
 }
 
 # Processes still running with this root as their appliance root (background workers
-# the library started), if any.
+# the library started, daemons given --root), if any.
 stragglers() {
-    local pid env
-    for env in /proc/[0-9]*/environ; do
-        pid=${env#/proc/}; pid=${pid%/environ}
+    local pid dir
+    for dir in /proc/[0-9]*; do
+        pid=${dir#/proc/}
         [ "$pid" = $$ ] && continue
-        if tr "\0" "\n" 2>/dev/null <"$env" | grep -qxF "ORLO_SYSROOT=$ROOT"; then echo "$pid"; fi
+        if tr "\0" "\n" 2>/dev/null <"$dir/environ" | grep -qxF "ORLO_SYSROOT=$ROOT" ||
+           tr "\0" "\n" 2>/dev/null <"$dir/cmdline" | grep -qxF "$ROOT"; then
+            echo "$pid"
+        fi
     done
 }
 
@@ -89,6 +93,10 @@ cleanup() {
         kill -KILL "$SIM_PID" 2>/dev/null
     fi
     local p
+    [ -n "$CAT_PID" ] && kill -TERM "$CAT_PID" 2>/dev/null
+    if [ -f "$ROOT/var/run/iscsi_snapshot_comm_core.pid" ]; then
+        kill -TERM "$(cat "$ROOT/var/run/iscsi_snapshot_comm_core.pid")" 2>/dev/null
+    fi
     for p in $(stragglers); do kill -TERM "$p" 2>/dev/null; done
     sleep 0.2
     for p in $(stragglers); do kill -KILL "$p" 2>/dev/null; done
@@ -167,6 +175,22 @@ run 'echo "target nodes in the kernel: $(ls $ROOT/config/target/iscsi | wc -l)"'
 run 'orloiscsi --root $ROOT service start'
 run 'orloiscsi --root $ROOT target status demo'
 run 'ls $ROOT/config/target/iscsi/iqn.2000-01.com.orlo-nas:demo/tpgt_1/lun'
+
+step "Two services talking through the messaging engine"
+run 'orlocommd --root $ROOT                                     # the engine: FIFOs under /tmp, TCP port 3262'
+printf '$ orlocomm-cat --root $ROOT --name greeter --echo > $ROOT/greeter.out &\n'
+orlocomm-cat --root "$ROOT" --name greeter --echo >"$ROOT/greeter.out" 2>&1 &
+CAT_PID=$!
+for _ in $(seq 50); do
+    orlocomm-cat --root "$ROOT" --ping localhost greeter 2>/dev/null | grep -q 0x1022 && break
+    sleep 0.1
+done
+echo
+run 'orlocomm-cat --root $ROOT --ping localhost greeter'
+run "printf 'hello\\nworld\\n' | orlocomm-cat --root \$ROOT --connect localhost greeter --wait-reply"
+kill "$CAT_PID" 2>/dev/null; wait "$CAT_PID" 2>/dev/null; CAT_PID=""
+run 'cat $ROOT/greeter.out                                      # what the service received'
+run 'kill $(cat $ROOT/var/run/iscsi_snapshot_comm_core.pid)      # the engine stops cleanly'
 
 step "One look at everything, while it runs"
 run 'orloiscsi --root $ROOT overview'
