@@ -1143,6 +1143,12 @@ const Kind *KindByName(const std::string &name) {
     static const std::map<std::string, Kind> table = [] {
         std::map<std::string, Kind> m;
         for (Kind &k : BuildTable()) {
+            // Attribute files are numbered in the 255 inode numbers after their
+            // directory's; the root's would take the control directory's numbers.
+            if (k.attrs.size() > 255 || (k.name == "root" && !k.attrs.empty())) {
+                fprintf(stderr, "orlo-configfs-sim: node kind '%s' has too many attribute files\n", k.name.c_str());
+                abort();
+            }
             for (size_t i = 0; i < k.attrs.size(); ++i) k.attrIndex[k.attrs[i].name] = static_cast<int>(i);
             std::string n = k.name;
             m.emplace(n, std::move(k));

@@ -133,13 +133,13 @@ int Sim::RemoveModuleLocked(const std::string &name) {
         Node *fabric = m->fabric != nullptr ? Find(std::string("/target/") + m->fabric) : nullptr;
         if (fabric != nullptr && HoldsUserContent(fabric)) return -EWOULDBLOCK;
         if (fabric != nullptr) {
-            Invalidate(TreePath(fabric));
+            Invalidate(fabric);
             DestroyNode(fabric);
         }
         for (auto it = m->nodes.rbegin(); it != m->nodes.rend(); ++it) {
             Node *node = Find(it->first);
             if (node == nullptr) continue;
-            Invalidate(it->first);
+            Invalidate(node);
             DestroyNode(node);
         }
     }

@@ -9,8 +9,16 @@
  * (configfs_modules.cpp).  The FUSE glue (configfs_sim_main.cpp) only translates
  * requests into the calls below.
  *
+ * Requests name files by inode number, which is also the FUSE node id: the root is 1,
+ * the control directory .sim is 2 and its files 3 to 7; every other directory or link
+ * gets the next multiple of 256 and its attribute files the numbers just after it, so
+ * an inode number leads straight to its node without a walk.  Numbers are never used
+ * twice, so a number the kernel still holds after its node went away only finds ENOENT.
+ *
  * Every public call takes the simulator's one mutex, so the model may be driven from
- * any number of FUSE worker threads; results are 0 or a negative errno.
+ * any number of FUSE worker threads; results are 0 or a negative errno.  The simulator
+ * owns every open handle: those the kernel never released (the mount went away while
+ * files were open) are freed with it.
  */
 #ifndef ORLO_SIM_CONFIGFS_SIM_H
 #define ORLO_SIM_CONFIGFS_SIM_H
@@ -20,6 +28,7 @@
 #include <cstdint>
 #include <deque>
 #include <functional>
+#include <list>
 #include <map>
 #include <memory>
 #include <mutex>
@@ -91,6 +100,7 @@ struct CloneState {
 
 struct Node {
     std::string name;
+    std::string path;            // tree path, "/target/core/..." ("/" for the root)
     const Kind *kind = nullptr;  // null for a symbolic link
     Node *parent = nullptr;
     bool user = false;  // made by a user (mkdir, symlink) rather than by the kernel
@@ -134,7 +144,14 @@ struct Fault {
     bool once = true;
 };
 
-// An open attribute or control file.
+// One name of a directory listing, with the inode number and file type it has.
+struct DirEntry {
+    std::string name;
+    uint64_t ino = 0;
+    mode_t type = 0;  // S_IFDIR, S_IFREG or S_IFLNK
+};
+
+// An open attribute file, control file or directory.
 struct Handle {
     uint64_t ino = 0;
     int attr = -1;
@@ -142,6 +159,17 @@ struct Handle {
     bool filled = false;
     std::string content;  // what show produced at the first read
     std::string path;
+    // Writes may wait on the kernel: control commands (a module removal invalidates the
+    // kernel's entries) and stores with side effects (they open host paths).
+    bool writeMayWait = false;
+    std::vector<DirEntry> listing;  // directories: the names as of the first readdir
+    std::list<Handle>::iterator self;
+};
+
+// A directory entry the kernel may hold that went away without a request of its own.
+struct Invalidation {
+    uint64_t parent = 0;
+    std::string name;
 };
 
 // Errno names used in the trace and in the fault control file.
@@ -159,24 +187,37 @@ class Sim {
     explicit Sim(const Options &o);
     ~Sim();
 
-    // File-system operations on tree paths ("/target/core/..."); 0 or -errno.
-    int GetAttr(const std::string &path, struct stat *st);
-    int ReadDir(const std::string &path, std::vector<std::string> *names);
-    int Mkdir(const std::string &path);
-    int Rmdir(const std::string &path);
-    int Symlink(const std::string &target, const std::string &link);
-    int Unlink(const std::string &path);
-    int Readlink(const std::string &path, std::string *out);
-    int Open(const std::string &path, int flags, std::unique_ptr<Handle> *h);
+    static constexpr uint64_t kRootIno = 1;
+    static constexpr uint64_t kControlIno = 2;
+
+    // File-system operations on inode numbers; 0 or -errno.  Those that return an
+    // entry fill st (st_ino is the entry's inode number).
+    int Lookup(uint64_t parent, const std::string &name, struct stat *st);
+    int GetAttr(uint64_t ino, struct stat *st);
+    // Mode, owner and times are accepted and forgotten, as configfs keeps them only in
+    // its inode; truncating an attribute does nothing, a directory is EISDIR.
+    int SetAttr(uint64_t ino, bool truncate, struct stat *st);
+    int Mkdir(uint64_t parent, const std::string &name, struct stat *st);
+    int Rmdir(uint64_t parent, const std::string &name);
+    int Symlink(const std::string &target, uint64_t parent, const std::string &name, struct stat *st);
+    int Unlink(uint64_t parent, const std::string &name);
+    int Readlink(uint64_t ino, std::string *out);
+    int Create(uint64_t parent, const std::string &name);
+    int Rename();
+    int Open(uint64_t ino, int flags, Handle **h);
     // Returns the byte count or -errno.
     int Read(Handle *h, char *buf, size_t size, off_t off);
     int Write(Handle *h, const char *data, size_t size);
-    int Rename();
-    int Create(const std::string &path);
+    int OpenDir(uint64_t ino, Handle **h);
+    // The listing of an open directory, taken anew when rewind is set (a read from
+    // offset 0) and kept for the later reads of the same open.
+    int ReadDir(Handle *h, bool rewind, const std::vector<DirEntry> **listing);
+    void Release(Handle *h);
+    size_t OpenHandles();
 
-    // Paths whose cached entries the kernel must drop (trees taken away by a module
-    // removal); the FUSE glue calls this after each control write.
-    std::vector<std::string> TakeInvalidations();
+    // Entries the kernel must drop (trees taken away by a module removal); the FUSE
+    // glue calls this after each control write.
+    std::vector<Invalidation> TakeInvalidations();
 
     // The control commands (also reachable through MOUNTPOINT/.sim/).  0 or -errno.
     int InsertModule(const std::string &name);
@@ -187,11 +228,12 @@ class Sim {
     const Options &options() const { return opts_; }
     bool ModuleInserted(const std::string &name) const;
     std::string HostPath(const std::string &appliancePath) const;  // maps under root
-    std::string TreePath(const Node *n) const;
+    const std::string &TreePath(const Node *n) const { return n->path; }
     std::vector<Session> &sessions() { return sessions_; }
     Node *root() { return root_.get(); }
     Node *Find(const std::string &path);
-    void Invalidate(const std::string &path) { invalidations_.push_back(path); }
+    // Records that the kernel must drop its entry for n (called before n is destroyed).
+    void Invalidate(const Node *n) { invalidations_.push_back(Invalidation{n->parent->ino, n->name}); }
 
   private:
     friend class Control;
@@ -200,6 +242,14 @@ class Sim {
         int attr = -1;
     };
     int Resolve(const std::string &path, Resolved *r);
+    // The node (and attribute, or -1) an inode number names; false when it is gone or
+    // names a control file.
+    bool ByIno(uint64_t ino, Resolved *r) const;
+    // The directory an inode number names (ENOENT gone, ENOTDIR an attribute or link).
+    int DirByIno(uint64_t ino, Node **dir) const;
+    std::string ChildPath(uint64_t parent, const std::string &name) const;
+    int ControlStat(uint64_t ino, struct stat *st) const;
+    Handle *NewHandle();
     Node *MakeNode(Node *parent, const std::string &name, const Kind *kind, bool user);
     void DestroyNode(Node *n);
     int CheckRemovable(Node *n);
@@ -208,7 +258,7 @@ class Sim {
     int Faulted(const std::string &op, const std::string &path);
     void FillStat(const Node *n, int attr, struct stat *st) const;
     std::string LinkText(const Node *link) const;
-    int ControlOpen(const std::string &name, std::unique_ptr<Handle> *h);
+    int ControlOpen(uint64_t ino, Handle **h);
     int ControlRead(Handle *h);
     int ControlWrite(Handle *h, const std::string &text);
     int ControlCommand(const std::string &file, const std::string &line);
@@ -224,7 +274,8 @@ class Sim {
     std::vector<Session> sessions_;
     std::deque<TraceEntry> trace_;
     std::vector<Fault> faults_;
-    std::vector<std::string> invalidations_;
+    std::vector<Invalidation> invalidations_;
+    std::list<Handle> handles_;  // every open file and directory
     time_t started_;
 };
 

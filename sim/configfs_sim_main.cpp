@@ -1,15 +1,24 @@
 /*
  * orlo-configfs-sim: mounts the configfs model as a FUSE file system.
  *
- * Requests are served by libfuse's multithreaded loop; attribute files are opened
- * with direct I/O so every read reaches the model (nothing is kept in the page cache),
- * and negative lookups are never cached.  Positive directory entries may be cached for
- * a short time: every change to the tree passes through this mount, and the trees a
- * module removal takes away are invalidated explicitly.
+ * It speaks FUSE's low-level protocol: requests name files by inode number and the
+ * model maps each number straight to its node, so no path is built or walked to
+ * answer them.  An attribute write from a shell or the library (open, write, close)
+ * costs three requests, open, write and release; the release is asynchronous and flush
+ * is never sent.  Open cannot be skipped: it is where configfs refuses a read-only file
+ * for writing, where the "open" fault fires, and it starts the one reading of a value
+ * that the reads of that open share.
+ *
+ * Attribute files are opened with direct I/O so every read and write reaches the model
+ * (nothing is kept in the page cache), and failed lookups are never cached.  Entries
+ * and attributes that exist may be cached for --entry-timeout seconds: every change to
+ * the tree passes through this mount (mkdir, rmdir, symlink and unlink are the
+ * kernel's own requests, so it updates its cache itself), except the trees a module
+ * removal takes away, which are invalidated before the control write returns.
  */
 #define FUSE_USE_VERSION 314
 
-#include <fuse3/fuse.h>
+#include <fuse3/fuse_lowlevel.h>
 #include <getopt.h>
 #include <limits.h>
 #include <sys/stat.h>
@@ -21,125 +30,220 @@
 #include <cstring>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include "configfs_sim.h"
+#include "configfs_sim_loop.h"
 
 namespace {
 
+using orlosim::DirEntry;
 using orlosim::Handle;
 using orlosim::Sim;
 
 struct Settings {
     double entryTimeout = 1.0;
+    struct fuse_session *session = nullptr;
+    orlosim::RequestLoop *loop = nullptr;
 };
 Settings g_settings;
 
-Sim *TheSim() { return static_cast<Sim *>(fuse_get_context()->private_data); }
+// The model, for a request answered on the reading thread.
+Sim *TheSim(fuse_req_t req) {
+    g_settings.loop->Served(fuse_req_ctx(req)->pid);
+    return static_cast<Sim *>(fuse_req_userdata(req));
+}
 Handle *H(struct fuse_file_info *fi) { return reinterpret_cast<Handle *>(fi->fh); }
 
-void *SimInit(struct fuse_conn_info *conn, struct fuse_config *cfg) {
-    cfg->use_ino = 1;
-    cfg->entry_timeout = g_settings.entryTimeout;
-    cfg->attr_timeout = g_settings.entryTimeout;
-    cfg->negative_timeout = 0;
-    cfg->direct_io = 1;
-    cfg->hard_remove = 1;
-    cfg->kernel_cache = 0;
+void ReplyEntry(fuse_req_t req, int rc, const struct stat &st) {
+    if (rc != 0) {
+        fuse_reply_err(req, -rc);
+        return;
+    }
+    struct fuse_entry_param e;
+    memset(&e, 0, sizeof(e));
+    e.ino = st.st_ino;
+    e.attr = st;
+    e.attr_timeout = g_settings.entryTimeout;
+    e.entry_timeout = g_settings.entryTimeout;
+    fuse_reply_entry(req, &e);
+}
+
+void ReplyAttr(fuse_req_t req, int rc, const struct stat &st) {
+    if (rc != 0)
+        fuse_reply_err(req, -rc);
+    else
+        fuse_reply_attr(req, &st, g_settings.entryTimeout);
+}
+
+void SimInit(void *, struct fuse_conn_info *conn) {
+    // O_TRUNC travels with the open instead of costing a setattr request of its own.
     if (conn->capable & FUSE_CAP_ATOMIC_O_TRUNC) conn->want |= FUSE_CAP_ATOMIC_O_TRUNC;
-    conn->want &= ~static_cast<unsigned>(FUSE_CAP_WRITEBACK_CACHE);
-    return fuse_get_context()->private_data;
+    conn->want &= ~static_cast<unsigned>(FUSE_CAP_WRITEBACK_CACHE | FUSE_CAP_SPLICE_READ | FUSE_CAP_SPLICE_WRITE |
+                                         FUSE_CAP_SPLICE_MOVE);
 }
 
-int SimGetattr(const char *path, struct stat *st, struct fuse_file_info *) { return TheSim()->GetAttr(path, st); }
+void SimLookup(fuse_req_t req, fuse_ino_t parent, const char *name) {
+    struct stat st;
+    ReplyEntry(req, TheSim(req)->Lookup(parent, name, &st), st);
+}
 
-int SimReadlink(const char *path, char *buf, size_t size) {
+// The model keeps nothing per kernel reference: node numbers are never used twice.
+void SimForget(fuse_req_t req, fuse_ino_t, uint64_t) { fuse_reply_none(req); }
+void SimForgetMulti(fuse_req_t req, size_t, struct fuse_forget_data *) { fuse_reply_none(req); }
+
+void SimGetattr(fuse_req_t req, fuse_ino_t ino, struct fuse_file_info *) {
+    struct stat st;
+    ReplyAttr(req, TheSim(req)->GetAttr(ino, &st), st);
+}
+
+void SimSetattr(fuse_req_t req, fuse_ino_t ino, struct stat *, int toSet, struct fuse_file_info *) {
+    struct stat st;
+    ReplyAttr(req, TheSim(req)->SetAttr(ino, (toSet & FUSE_SET_ATTR_SIZE) != 0, &st), st);
+}
+
+void SimReadlink(fuse_req_t req, fuse_ino_t ino) {
     std::string s;
-    int rc = TheSim()->Readlink(path, &s);
-    if (rc != 0) return rc;
-    if (size == 0) return -EINVAL;
-    size_t n = std::min(s.size(), size - 1);
-    memcpy(buf, s.data(), n);
-    buf[n] = '\0';
-    return 0;
+    int rc = TheSim(req)->Readlink(ino, &s);
+    if (rc != 0)
+        fuse_reply_err(req, -rc);
+    else
+        fuse_reply_readlink(req, s.c_str());
 }
 
-int SimMkdir(const char *path, mode_t) { return TheSim()->Mkdir(path); }
-int SimRmdir(const char *path) { return TheSim()->Rmdir(path); }
-int SimUnlink(const char *path) { return TheSim()->Unlink(path); }
-int SimSymlink(const char *target, const char *link) { return TheSim()->Symlink(target, link); }
-int SimRename(const char *, const char *, unsigned int) { return TheSim()->Rename(); }
-int SimLink(const char *, const char *) { return -EPERM; }
-int SimMknod(const char *path, mode_t, dev_t) { return TheSim()->Create(path); }
-int SimCreate(const char *path, mode_t, struct fuse_file_info *) { return TheSim()->Create(path); }
-
-// Mode, owner and times are accepted and forgotten, as configfs keeps them only in
-// its inode; truncating an attribute (echo > file) does nothing.
-int SimChmod(const char *path, mode_t, struct fuse_file_info *) {
-    struct stat st;
-    return TheSim()->GetAttr(path, &st);
-}
-int SimChown(const char *path, uid_t, gid_t, struct fuse_file_info *) {
-    struct stat st;
-    return TheSim()->GetAttr(path, &st);
-}
-int SimUtimens(const char *path, const struct timespec *, struct fuse_file_info *) {
-    struct stat st;
-    return TheSim()->GetAttr(path, &st);
-}
-int SimTruncate(const char *path, off_t, struct fuse_file_info *) {
-    struct stat st;
-    int rc = TheSim()->GetAttr(path, &st);
-    if (rc == 0 && S_ISDIR(st.st_mode)) return -EISDIR;
-    return rc;
+void SimMknod(fuse_req_t req, fuse_ino_t parent, const char *name, mode_t, dev_t) {
+    fuse_reply_err(req, -TheSim(req)->Create(parent, name));
 }
 
-int SimOpen(const char *path, struct fuse_file_info *fi) {
-    std::unique_ptr<Handle> h;
-    int rc = TheSim()->Open(path, fi->flags, &h);
-    if (rc != 0) return rc;
-    fi->fh = reinterpret_cast<uint64_t>(h.release());
+void SimCreate(fuse_req_t req, fuse_ino_t parent, const char *name, mode_t, struct fuse_file_info *) {
+    fuse_reply_err(req, -TheSim(req)->Create(parent, name));
+}
+
+void SimMkdir(fuse_req_t req, fuse_ino_t parent, const char *name, mode_t) {
+    struct stat st;
+    ReplyEntry(req, TheSim(req)->Mkdir(parent, name, &st), st);
+}
+
+void SimUnlink(fuse_req_t req, fuse_ino_t parent, const char *name) {
+    fuse_reply_err(req, -TheSim(req)->Unlink(parent, name));
+}
+
+void SimRmdir(fuse_req_t req, fuse_ino_t parent, const char *name) {
+    fuse_reply_err(req, -TheSim(req)->Rmdir(parent, name));
+}
+
+void SimSymlink(fuse_req_t req, const char *target, fuse_ino_t parent, const char *name) {
+    struct stat st;
+    ReplyEntry(req, TheSim(req)->Symlink(target, parent, name, &st), st);
+}
+
+void SimRename(fuse_req_t req, fuse_ino_t, const char *, fuse_ino_t, const char *, unsigned int) {
+    fuse_reply_err(req, -TheSim(req)->Rename());
+}
+
+void SimLink(fuse_req_t req, fuse_ino_t, fuse_ino_t, const char *) { fuse_reply_err(req, EPERM); }
+
+void SimOpen(fuse_req_t req, fuse_ino_t ino, struct fuse_file_info *fi) {
+    Handle *h = nullptr;
+    int rc = TheSim(req)->Open(ino, fi->flags, &h);
+    if (rc != 0) {
+        fuse_reply_err(req, -rc);
+        return;
+    }
+    fi->fh = reinterpret_cast<uint64_t>(h);
     fi->direct_io = 1;
     fi->keep_cache = 0;
-    return 0;
+    fi->noflush = 1;  // close has nothing to report: no flush request
+    // An open the caller gave up on (interrupted) gets no release: free it here.
+    if (fuse_reply_open(req, fi) == -ENOENT) TheSim(req)->Release(h);
 }
 
-int SimRead(const char *, char *buf, size_t size, off_t off, struct fuse_file_info *fi) {
-    return TheSim()->Read(H(fi), buf, size, off);
+void SimRead(fuse_req_t req, fuse_ino_t, size_t size, off_t off, struct fuse_file_info *fi) {
+    std::unique_ptr<char[]> buf(new char[size > 0 ? size : 1]);
+    int n = TheSim(req)->Read(H(fi), buf.get(), size, off);
+    if (n < 0)
+        fuse_reply_err(req, -n);
+    else
+        fuse_reply_buf(req, buf.get(), static_cast<size_t>(n));
 }
 
-int SimWrite(const char *, const char *buf, size_t size, off_t, struct fuse_file_info *fi) {
-    Sim *sim = TheSim();
-    int rc = sim->Write(H(fi), buf, size);
-    if (!H(fi)->control.empty()) {
-        // Trees a module removal took away: drop the kernel's cached entries for them.
-        for (const std::string &p : sim->TakeInvalidations()) fuse_invalidate_path(fuse_get_context()->fuse, p.c_str());
+void Write(fuse_req_t req, Sim *sim, Handle *h, const char *buf, size_t size) {
+    int rc = sim->Write(h, buf, size);
+    if (!h->control.empty()) {
+        // Trees a module removal took away: the kernel drops its entries for them before
+        // the write returns, so the caller's next look finds them gone.
+        for (const orlosim::Invalidation &inv : sim->TakeInvalidations())
+            fuse_lowlevel_notify_inval_entry(g_settings.session, inv.parent, inv.name.c_str(), inv.name.size());
     }
-    return rc;
+    if (rc < 0)
+        fuse_reply_err(req, -rc);
+    else
+        fuse_reply_write(req, static_cast<size_t>(rc));
 }
 
-int SimRelease(const char *, struct fuse_file_info *fi) {
-    delete H(fi);
-    fi->fh = 0;
-    return 0;
+void SimWrite(fuse_req_t req, fuse_ino_t, const char *buf, size_t size, off_t, struct fuse_file_info *fi) {
+    Sim *sim = TheSim(req);
+    Handle *h = H(fi);
+    if (!h->writeMayWait) {
+        Write(req, sim, h, buf, size);
+        return;
+    }
+    // The bytes live only as long as this call: the helper gets its own copy.
+    std::string data(buf, size);
+    g_settings.loop->Defer([req, sim, h, data] { Write(req, sim, h, data.data(), data.size()); });
 }
 
-int SimReaddir(const char *path, void *buf, fuse_fill_dir_t filler, off_t, struct fuse_file_info *,
-               enum fuse_readdir_flags) {
-    std::vector<std::string> names;
-    int rc = TheSim()->ReadDir(path, &names);
-    if (rc != 0) return rc;
-    filler(buf, ".", nullptr, 0, static_cast<fuse_fill_dir_flags>(0));
-    filler(buf, "..", nullptr, 0, static_cast<fuse_fill_dir_flags>(0));
-    for (const std::string &n : names) filler(buf, n.c_str(), nullptr, 0, static_cast<fuse_fill_dir_flags>(0));
-    return 0;
+void SimRelease(fuse_req_t req, fuse_ino_t, struct fuse_file_info *fi) {
+    TheSim(req)->Release(H(fi));
+    fuse_reply_err(req, 0);
 }
 
-int SimStatfs(const char *, struct statvfs *st) {
-    memset(st, 0, sizeof(*st));
-    st->f_bsize = 4096;
-    st->f_frsize = 4096;
-    st->f_namemax = 255;
-    return 0;
+void SimOpendir(fuse_req_t req, fuse_ino_t ino, struct fuse_file_info *fi) {
+    Handle *h = nullptr;
+    int rc = TheSim(req)->OpenDir(ino, &h);
+    if (rc != 0) {
+        fuse_reply_err(req, -rc);
+        return;
+    }
+    fi->fh = reinterpret_cast<uint64_t>(h);
+    if (fuse_reply_open(req, fi) == -ENOENT) TheSim(req)->Release(h);
+}
+
+void SimReaddir(fuse_req_t req, fuse_ino_t, size_t size, off_t off, struct fuse_file_info *fi) {
+    const std::vector<DirEntry> *listing = nullptr;
+    int rc = TheSim(req)->ReadDir(H(fi), off == 0, &listing);
+    if (rc != 0) {
+        fuse_reply_err(req, -rc);
+        return;
+    }
+    std::unique_ptr<char[]> buf(new char[size > 0 ? size : 1]);
+    size_t used = 0;
+    for (size_t i = off < 0 ? listing->size() : static_cast<size_t>(off); i < listing->size(); ++i) {
+        const DirEntry &e = (*listing)[i];
+        struct stat st;
+        memset(&st, 0, sizeof(st));
+        st.st_ino = e.ino;
+        st.st_mode = e.type;
+        size_t need = fuse_add_direntry(req, buf.get() + used, size - used, e.name.c_str(), &st,
+                                        static_cast<off_t>(i + 1));
+        if (need > size - used) break;
+        used += need;
+    }
+    fuse_reply_buf(req, buf.get(), used);
+}
+
+void SimReleasedir(fuse_req_t req, fuse_ino_t, struct fuse_file_info *fi) {
+    TheSim(req)->Release(H(fi));
+    fuse_reply_err(req, 0);
+}
+
+void SimStatfs(fuse_req_t req, fuse_ino_t) {
+    struct statvfs st;
+    memset(&st, 0, sizeof(st));
+    st.f_bsize = 4096;
+    st.f_frsize = 4096;
+    st.f_namemax = 255;
+    fuse_reply_statfs(req, &st);
 }
 
 const char kUsage[] =
@@ -193,10 +297,12 @@ int main(int argc, char **argv) {
     opts.root = envRoot != nullptr && envRoot[0] != '\0' ? envRoot : "/";
     unsigned threads = 8;
     bool daemon = false;
+    bool follow = true;
     static const struct option longOpts[] = {
         {"root", required_argument, nullptr, 'r'},        {"trace-limit", required_argument, nullptr, 't'},
         {"threads", required_argument, nullptr, 'n'},     {"entry-timeout", required_argument, nullptr, 'e'},
-        {"daemon", no_argument, nullptr, 'd'},            {"help", no_argument, nullptr, 'h'},
+        {"no-follow", no_argument, nullptr, 'f'},         {"daemon", no_argument, nullptr, 'd'},
+        {"help", no_argument, nullptr, 'h'},
         {nullptr, 0, nullptr, 0}};
     int c;
     while ((c = getopt_long(argc, argv, "dh", longOpts, nullptr)) != -1) {
@@ -205,6 +311,7 @@ int main(int argc, char **argv) {
             case 't': opts.traceLimit = strtoul(optarg, nullptr, 10); break;
             case 'n': threads = static_cast<unsigned>(strtoul(optarg, nullptr, 10)); break;
             case 'e': g_settings.entryTimeout = strtod(optarg, nullptr); break;
+            case 'f': follow = false; break;
             case 'd': daemon = true; break;
             case 'h': fputs(kUsage, stdout); return 0;
             default: fputs(kUsage, stderr); return 2;
@@ -221,62 +328,65 @@ int main(int argc, char **argv) {
     }
     opts.mountpoint = real;
     if (argv[optind][0] == '/') opts.mountAlias = argv[optind];
-    if (threads == 0) threads = 1;
+    // The reading thread and at least one helper for the requests that may wait.
+    if (threads < 2) threads = 2;
+    if (g_settings.entryTimeout < 0) g_settings.entryTimeout = 0;
     Sim sim(opts);
 
-    struct fuse_operations ops;
+    struct fuse_lowlevel_ops ops;
     memset(&ops, 0, sizeof(ops));
     ops.init = SimInit;
+    ops.lookup = SimLookup;
+    ops.forget = SimForget;
+    ops.forget_multi = SimForgetMulti;
     ops.getattr = SimGetattr;
+    ops.setattr = SimSetattr;
     ops.readlink = SimReadlink;
+    ops.mknod = SimMknod;
     ops.mkdir = SimMkdir;
-    ops.rmdir = SimRmdir;
     ops.unlink = SimUnlink;
+    ops.rmdir = SimRmdir;
     ops.symlink = SimSymlink;
     ops.rename = SimRename;
     ops.link = SimLink;
-    ops.mknod = SimMknod;
-    ops.create = SimCreate;
-    ops.chmod = SimChmod;
-    ops.chown = SimChown;
-    ops.utimens = SimUtimens;
-    ops.truncate = SimTruncate;
     ops.open = SimOpen;
     ops.read = SimRead;
     ops.write = SimWrite;
     ops.release = SimRelease;
+    ops.opendir = SimOpendir;
     ops.readdir = SimReaddir;
+    ops.releasedir = SimReleasedir;
     ops.statfs = SimStatfs;
+    ops.create = SimCreate;
 
     char arg0[] = "orlo-configfs-sim";
     char argO[] = "-o";
     char argOpts[] = "fsname=orlo-configfs-sim,subtype=orlo-configfs-sim";
     char *fargv[] = {arg0, argO, argOpts, nullptr};
     struct fuse_args args = FUSE_ARGS_INIT(3, fargv);
-    struct fuse *f = fuse_new(&args, &ops, sizeof(ops), &sim);
-    if (f == nullptr) {
-        fprintf(stderr, "orlo-configfs-sim: fuse_new failed\n");
+    struct fuse_session *se = fuse_session_new(&args, &ops, sizeof(ops), &sim);
+    fuse_opt_free_args(&args);
+    if (se == nullptr) {
+        fprintf(stderr, "orlo-configfs-sim: cannot start a FUSE session\n");
         return 1;
     }
+    g_settings.session = se;
     int rc = 1;
-    if (fuse_mount(f, real) != 0) {
-        fprintf(stderr, "orlo-configfs-sim: cannot mount on %s\n", real);
-    } else {
-        struct fuse_session *se = fuse_get_session(f);
-        if (fuse_set_signal_handlers(se) == 0) {
+    if (fuse_set_signal_handlers(se) == 0) {
+        if (fuse_session_mount(se, real) != 0) {
+            fprintf(stderr, "orlo-configfs-sim: cannot mount on %s\n", real);
+        } else {
             if (fuse_daemonize(daemon ? 0 : 1) == 0) {
-                struct fuse_loop_config *cfg = fuse_loop_cfg_create();
-                fuse_loop_cfg_set_max_threads(cfg, threads);
-                fuse_loop_cfg_set_idle_threads(cfg, threads < 4 ? threads : 4);
-                int loop = fuse_loop_mt(f, cfg);
-                rc = loop >= 0 ? 0 : 1;  // a positive value is the signal that ended it
-                fuse_loop_cfg_destroy(cfg);
+                orlosim::RequestLoop loop(se, threads - 1, follow);
+                g_settings.loop = &loop;
+                int end = loop.Run();
+                rc = end >= 0 ? 0 : 1;  // a positive value is the signal that ended it
             }
-            fuse_remove_signal_handlers(se);
+            g_settings.loop = nullptr;
+            fuse_session_unmount(se);
         }
-        fuse_unmount(f);
+        fuse_remove_signal_handlers(se);
     }
-    fuse_destroy(f);
-    fuse_opt_free_args(&args);
+    fuse_session_destroy(se);
     return rc;
 }

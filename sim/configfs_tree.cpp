@@ -73,12 +73,6 @@ std::vector<std::string> Components(const std::string &path) {
     return out;
 }
 
-void SplitLast(const std::string &path, std::string *dir, std::string *name) {
-    size_t slash = path.rfind('/');
-    *dir = slash == 0 ? "/" : path.substr(0, slash);
-    *name = path.substr(slash + 1);
-}
-
 bool IsControl(const std::string &path) { return path == "/.sim" || path.compare(0, 6, "/.sim/") == 0; }
 
 const char *const kControlFiles[] = {"modules", "trace", "faults", "sessions", "clone"};
@@ -113,10 +107,11 @@ Sim::Sim(const Options &o) : opts_(o), started_(time(nullptr)) {
     if (opts_.root.empty()) opts_.root = "/";
     root_.reset(new Node);
     root_->name = "";
+    root_->path = "/";
     root_->kind = KindByName("root");
-    root_->ino = 1;
+    root_->ino = kRootIno;
     root_->ctime = started_;
-    byIno_[1] = root_.get();
+    byIno_[kRootIno] = root_.get();
     nextIno_ = 256;
 }
 
@@ -125,6 +120,7 @@ Sim::~Sim() = default;
 Node *Sim::MakeNode(Node *parent, const std::string &name, const Kind *kind, bool user) {
     std::unique_ptr<Node> n(new Node);
     n->name = name;
+    n->path = (parent->parent == nullptr ? std::string() : parent->path) + "/" + name;
     n->kind = kind;
     n->parent = parent;
     n->user = user;
@@ -167,13 +163,6 @@ bool Sim::HoldsUserContent(const Node *n) const {
     return false;
 }
 
-std::string Sim::TreePath(const Node *n) const {
-    if (n->parent == nullptr) return "/";
-    std::string p;
-    for (; n->parent != nullptr; n = n->parent) p = "/" + n->name + p;
-    return p;
-}
-
 std::string Sim::HostPath(const std::string &path) const {
     if (path.empty() || path[0] != '/' || opts_.root == "/") return path;
     for (const char *keep : {"/dev", "/proc", "/sys"}) {
@@ -189,8 +178,8 @@ Node *Sim::Find(const std::string &path) {
     return r.node;
 }
 
-// Walks the tree, following links met on the way (the kernel resolves them before it
-// asks us); the last component is not followed.
+// Walks the tree, following links met on the way; the last component is not followed.
+// Used for the paths written into the control files and for link targets.
 int Sim::Resolve(const std::string &path, Resolved *r) {
     Node *n = root_.get();
     std::vector<std::string> parts = Components(path);
@@ -212,6 +201,34 @@ int Sim::Resolve(const std::string &path, Resolved *r) {
     r->node = n;
     r->attr = -1;
     return 0;
+}
+
+bool Sim::ByIno(uint64_t ino, Resolved *r) const {
+    uint64_t base = ino == kRootIno ? kRootIno : ino & ~static_cast<uint64_t>(0xff);
+    if (base == 0) return false;  // the control directory and its files
+    auto it = byIno_.find(base);
+    if (it == byIno_.end()) return false;
+    int attr = static_cast<int>(ino - base) - 1;
+    if (attr >= 0 && (it->second->IsLink() || static_cast<size_t>(attr) >= it->second->kind->attrs.size()))
+        return false;
+    r->node = it->second;
+    r->attr = attr;
+    return true;
+}
+
+int Sim::DirByIno(uint64_t ino, Node **dir) const {
+    Resolved r;
+    if (!ByIno(ino, &r)) return ENOENT;
+    if (r.attr >= 0 || r.node->IsLink()) return ENOTDIR;
+    *dir = r.node;
+    return 0;
+}
+
+std::string Sim::ChildPath(uint64_t parent, const std::string &name) const {
+    if (parent == kControlIno) return "/.sim/" + name;
+    Resolved r;
+    if (!ByIno(parent, &r) || r.node == root_.get()) return "/" + name;
+    return r.node->path + "/" + name;
 }
 
 void Sim::Trace(const std::string &op, const std::string &path, const std::string &value, int err) {
@@ -245,6 +262,7 @@ void Sim::FillStat(const Node *n, int attr, struct stat *st) const {
         st->st_ino = n->ino;
         st->st_mode = S_IFLNK | 0777;
         st->st_nlink = 1;
+        st->st_size = static_cast<off_t>(LinkText(n).size());
     } else {
         st->st_ino = n->ino;
         st->st_mode = S_IFDIR | 0755;
@@ -256,77 +274,75 @@ void Sim::FillStat(const Node *n, int attr, struct stat *st) const {
     }
 }
 
-int Sim::GetAttr(const std::string &path, struct stat *st) {
-    std::lock_guard<std::mutex> lock(mu_);
-    if (IsControl(path)) {
-        memset(st, 0, sizeof(*st));
-        st->st_atime = st->st_mtime = st->st_ctime = started_;
-        if (path == "/.sim") {
-            st->st_mode = S_IFDIR | 0755;
-            st->st_nlink = 2;
-            st->st_ino = 2;
-            return 0;
-        }
-        for (size_t i = 0; i < sizeof(kControlFiles) / sizeof(kControlFiles[0]); ++i)
-            if (path.substr(6) == kControlFiles[i]) {
-                st->st_mode = S_IFREG | 0644;
-                st->st_nlink = 1;
-                st->st_ino = 3 + i;
-                st->st_size = 4096;
-                return 0;
-            }
-        return -ENOENT;
-    }
-    Resolved r;
-    int rc = Resolve(path, &r);
-    if (rc != 0) return rc;
-    FillStat(r.node, r.attr, st);
-    if (r.attr < 0 && r.node->IsLink()) st->st_size = static_cast<off_t>(LinkText(r.node).size());
-    return 0;
-}
-
-int Sim::ReadDir(const std::string &path, std::vector<std::string> *names) {
-    std::lock_guard<std::mutex> lock(mu_);
-    if (path == "/.sim") {
-        for (const char *f : kControlFiles) names->push_back(f);
+int Sim::ControlStat(uint64_t ino, struct stat *st) const {
+    memset(st, 0, sizeof(*st));
+    st->st_atime = st->st_mtime = st->st_ctime = started_;
+    if (ino == kControlIno) {
+        st->st_mode = S_IFDIR | 0755;
+        st->st_nlink = 2;
+        st->st_ino = kControlIno;
         return 0;
     }
-    Resolved r;
-    int rc = Resolve(path, &r);
-    if (rc != 0) return rc;
-    Node *n = r.node;
-    if (r.attr >= 0) return -ENOTDIR;
-    if (n->IsLink()) n = n->target;
-    for (const AttrDef &a : n->kind->attrs) names->push_back(a.name);
-    for (auto &c : n->children) names->push_back(c.first);
+    if (ino < kControlIno + 1 || ino >= kControlIno + 1 + sizeof(kControlFiles) / sizeof(kControlFiles[0]))
+        return -ENOENT;
+    st->st_mode = S_IFREG | 0644;
+    st->st_nlink = 1;
+    st->st_ino = ino;
+    st->st_size = 4096;
     return 0;
 }
 
-int Sim::Mkdir(const std::string &path) {
+int Sim::Lookup(uint64_t parent, const std::string &name, struct stat *st) {
     std::lock_guard<std::mutex> lock(mu_);
+    if (parent == kRootIno && name == ".sim") return ControlStat(kControlIno, st);
+    if (parent == kControlIno) {
+        for (size_t i = 0; i < sizeof(kControlFiles) / sizeof(kControlFiles[0]); ++i)
+            if (name == kControlFiles[i]) return ControlStat(kControlIno + 1 + i, st);
+        return -ENOENT;
+    }
+    Node *dir = nullptr;
+    int err = DirByIno(parent, &dir);
+    if (err != 0) return -err;
+    if (Node *c = dir->Child(name)) {
+        FillStat(c, -1, st);
+        return 0;
+    }
+    int a = dir->kind->Attr(name);
+    if (a < 0) return -ENOENT;
+    FillStat(dir, a, st);
+    return 0;
+}
+
+int Sim::GetAttr(uint64_t ino, struct stat *st) {
+    std::lock_guard<std::mutex> lock(mu_);
+    Resolved r;
+    if (!ByIno(ino, &r)) return ControlStat(ino, st);
+    FillStat(r.node, r.attr, st);
+    return 0;
+}
+
+int Sim::SetAttr(uint64_t ino, bool truncate, struct stat *st) {
+    int rc = GetAttr(ino, st);
+    if (rc == 0 && truncate && S_ISDIR(st->st_mode)) return -EISDIR;
+    return rc;
+}
+
+int Sim::Mkdir(uint64_t parent, const std::string &name, struct stat *st) {
+    std::lock_guard<std::mutex> lock(mu_);
+    std::string path = ChildPath(parent, name);
     int err = Faulted("mkdir", path);
     if (err == 0 && IsControl(path)) err = EPERM;
+    Node *dir = nullptr;
+    if (err == 0) err = DirByIno(parent, &dir);
     if (err == 0) {
-        std::string dir, name;
-        SplitLast(path, &dir, &name);
-        Resolved r;
-        int rc = Resolve(dir, &r);
-        Node *parent = r.node;
-        if (rc != 0) {
-            err = -rc;
-        } else if (r.attr >= 0) {
-            err = ENOTDIR;
-        } else {
-            if (parent->IsLink()) parent = parent->target;
-            const Kind *kind = nullptr;
-            if (parent->Child(name) != nullptr || parent->kind->Attr(name) >= 0)
-                err = EEXIST;
-            else if (!parent->kind->makeChild)
-                err = EPERM;
-            else
-                err = parent->kind->makeChild(*this, *parent, name, &kind);
-            if (err == 0) MakeNode(parent, name, kind, true);
-        }
+        const Kind *kind = nullptr;
+        if (dir->Child(name) != nullptr || dir->kind->Attr(name) >= 0)
+            err = EEXIST;
+        else if (!dir->kind->makeChild)
+            err = EPERM;
+        else
+            err = dir->kind->makeChild(*this, *dir, name, &kind);
+        if (err == 0) FillStat(MakeNode(dir, name, kind, true), -1, st);
     }
     Trace("mkdir", path, "", err);
     return -err;
@@ -339,29 +355,32 @@ int Sim::CheckRemovable(Node *n) {
     return 0;
 }
 
-int Sim::Rmdir(const std::string &path) {
+int Sim::Rmdir(uint64_t parent, const std::string &name) {
     std::lock_guard<std::mutex> lock(mu_);
+    std::string path = ChildPath(parent, name);
     int err = Faulted("rmdir", path);
     if (err == 0 && IsControl(path)) err = EPERM;
+    Node *dir = nullptr;
+    if (err == 0) err = DirByIno(parent, &dir);
+    Node *n = nullptr;
     if (err == 0) {
-        Resolved r;
-        int rc = Resolve(path, &r);
-        if (rc != 0)
-            err = -rc;
-        else if (r.attr >= 0 || r.node->IsLink())
+        n = dir->Child(name);
+        if (n == nullptr)
+            err = dir->kind->Attr(name) >= 0 ? ENOTDIR : ENOENT;
+        else if (n->IsLink())
             err = ENOTDIR;
         else
-            err = CheckRemovable(r.node);
-        if (err == 0) DestroyNode(r.node);
+            err = CheckRemovable(n);
     }
+    if (err == 0) DestroyNode(n);
     Trace("rmdir", path, "", err);
     return -err;
 }
 
-int Sim::Symlink(const std::string &target, const std::string &link) {
+int Sim::Symlink(const std::string &target, uint64_t parent, const std::string &name, struct stat *st) {
     std::lock_guard<std::mutex> lock(mu_);
-    std::string dir, name;
-    SplitLast(link, &dir, &name);
+    std::string link = ChildPath(parent, name);
+    std::string dirPath = link.substr(0, link.rfind('/'));
     // The link's target as a tree path: an absolute path must lie inside this mount
     // (configfs refuses links that leave it with EPERM); a relative one is taken from
     // the link's directory.
@@ -382,7 +401,7 @@ int Sim::Symlink(const std::string &target, const std::string &link) {
             else
                 err = EPERM;
         } else {
-            parts = Components(dir);
+            parts = Components(dirPath);
             for (const std::string &p : Components(target)) parts.push_back(p);
         }
         std::vector<std::string> norm;
@@ -401,32 +420,26 @@ int Sim::Symlink(const std::string &target, const std::string &link) {
         for (const std::string &p : norm) treeTarget += "/" + p;
         if (treeTarget.empty()) treeTarget = "/";
     }
+    Node *dir = nullptr;
+    if (err == 0) err = DirByIno(parent, &dir);
     if (err == 0) {
-        Resolved d, t;
-        int rc = Resolve(dir, &d);
-        if (rc != 0) {
-            err = -rc;
-        } else if (d.attr >= 0) {
-            err = ENOTDIR;
+        Resolved t;
+        if (dir->Child(name) != nullptr || dir->kind->Attr(name) >= 0) {
+            err = EEXIST;
+        } else if (IsControl(treeTarget) || Resolve(treeTarget, &t) != 0 || t.attr >= 0 || t.node == root_.get()) {
+            err = ENOENT;  // only directories of the tree can be linked to
         } else {
-            Node *parent = d.node->IsLink() ? d.node->target : d.node;
-            if (parent->Child(name) != nullptr || parent->kind->Attr(name) >= 0) {
-                err = EEXIST;
-            } else if (IsControl(treeTarget) || Resolve(treeTarget, &t) != 0 || t.attr >= 0 ||
-                       t.node == root_.get()) {
-                err = ENOENT;  // only directories of the tree can be linked to
-            } else {
-                Node *tn = t.node->IsLink() ? t.node->target : t.node;
-                if (!parent->kind->allowLink)
-                    err = EPERM;
-                else
-                    err = parent->kind->allowLink(*this, *parent, *tn);
-                if (err == 0) {
-                    Node *l = MakeNode(parent, name, nullptr, true);
-                    l->target = tn;
-                    ++tn->linkedBy;
-                    treeTarget = TreePath(tn);
-                }
+            Node *tn = t.node->IsLink() ? t.node->target : t.node;
+            if (!dir->kind->allowLink)
+                err = EPERM;
+            else
+                err = dir->kind->allowLink(*this, *dir, *tn);
+            if (err == 0) {
+                Node *l = MakeNode(dir, name, nullptr, true);
+                l->target = tn;
+                ++tn->linkedBy;
+                treeTarget = TreePath(tn);
+                FillStat(l, -1, st);
             }
         }
     }
@@ -434,32 +447,32 @@ int Sim::Symlink(const std::string &target, const std::string &link) {
     return -err;
 }
 
-int Sim::Unlink(const std::string &path) {
+int Sim::Unlink(uint64_t parent, const std::string &name) {
     std::lock_guard<std::mutex> lock(mu_);
+    std::string path = ChildPath(parent, name);
     int err = Faulted("unlink", path);
     if (err == 0 && IsControl(path)) err = EPERM;
+    Node *dir = nullptr;
+    if (err == 0) err = DirByIno(parent, &dir);
+    Node *n = nullptr;
     if (err == 0) {
-        Resolved r;
-        int rc = Resolve(path, &r);
-        if (rc != 0)
-            err = -rc;
-        else if (r.attr >= 0)
-            err = EPERM;  // attribute files belong to the kernel
-        else if (!r.node->IsLink())
+        n = dir->Child(name);
+        if (n == nullptr)
+            err = dir->kind->Attr(name) >= 0 ? EPERM : ENOENT;  // attribute files belong to the kernel
+        else if (!n->IsLink())
             err = EISDIR;
-        if (err == 0) DestroyNode(r.node);
     }
+    if (err == 0) DestroyNode(n);
     Trace("unlink", path, "", err);
     return -err;
 }
 
 // Links read back relative to the link's directory, "../" up to the mount root and
 // then the target's path, as configfs writes them.
-int Sim::Readlink(const std::string &path, std::string *out) {
+int Sim::Readlink(uint64_t ino, std::string *out) {
     std::lock_guard<std::mutex> lock(mu_);
     Resolved r;
-    int rc = Resolve(path, &r);
-    if (rc != 0) return rc;
+    if (!ByIno(ino, &r)) return -ENOENT;
     if (r.attr >= 0 || !r.node->IsLink()) return -EINVAL;
     *out = LinkText(r.node);
     return 0;
@@ -471,31 +484,48 @@ std::string Sim::LinkText(const Node *link) const {
     return s + TreePath(link->target).substr(1);
 }
 
-int Sim::Create(const std::string &path) {
-    std::lock_guard<std::mutex> lock(mu_);
-    (void)path;
+int Sim::Create(uint64_t, const std::string &) {
     return -EACCES;  // users cannot make attribute files
 }
 
 int Sim::Rename() { return -EPERM; }
 
-int Sim::Open(const std::string &path, int flags, std::unique_ptr<Handle> *h) {
+Handle *Sim::NewHandle() {
+    handles_.emplace_back();
+    Handle *h = &handles_.back();
+    h->self = std::prev(handles_.end());
+    return h;
+}
+
+void Sim::Release(Handle *h) {
     std::lock_guard<std::mutex> lock(mu_);
-    if (IsControl(path)) return ControlOpen(path.size() > 6 ? path.substr(6) : std::string(), h);
+    handles_.erase(h->self);
+}
+
+size_t Sim::OpenHandles() {
+    std::lock_guard<std::mutex> lock(mu_);
+    return handles_.size();
+}
+
+int Sim::Open(uint64_t ino, int flags, Handle **h) {
+    std::lock_guard<std::mutex> lock(mu_);
+    Resolved r;
+    if (!ByIno(ino, &r)) return ControlOpen(ino, h);
+    std::string path = r.node->path;
+    if (r.attr >= 0)
+        path = (r.node == root_.get() ? std::string() : path) + "/" + r.node->kind->attrs[static_cast<size_t>(r.attr)].name;
     int err = Faulted("open", path);
     if (err != 0) return -err;
-    Resolved r;
-    int rc = Resolve(path, &r);
-    if (rc != 0) return rc;
     if (r.attr < 0) return -EISDIR;
     int mode = r.node->kind->attrs[static_cast<size_t>(r.attr)].mode;
     int acc = flags & O_ACCMODE;
     if ((acc == O_WRONLY || acc == O_RDWR) && (mode & 0222) == 0) return -EACCES;
     if ((acc == O_RDONLY || acc == O_RDWR) && (mode & 0444) == 0) return -EACCES;
-    h->reset(new Handle);
+    *h = NewHandle();
     (*h)->ino = r.node->ino;
     (*h)->attr = r.attr;
-    (*h)->path = path;
+    (*h)->path = std::move(path);
+    (*h)->writeMayWait = r.node->kind->attrs[static_cast<size_t>(r.attr)].store != nullptr;
     return 0;
 }
 
@@ -563,24 +593,61 @@ int Sim::Write(Handle *h, const char *data, size_t size) {
     return err != 0 ? -err : static_cast<int>(count);
 }
 
-std::vector<std::string> Sim::TakeInvalidations() {
+int Sim::OpenDir(uint64_t ino, Handle **h) {
     std::lock_guard<std::mutex> lock(mu_);
-    std::vector<std::string> v;
+    if (ino != kControlIno) {
+        Node *dir = nullptr;
+        int err = DirByIno(ino, &dir);
+        if (err != 0) return -err;
+    }
+    *h = NewHandle();
+    (*h)->ino = ino;
+    return 0;
+}
+
+int Sim::ReadDir(Handle *h, bool rewind, const std::vector<DirEntry> **listing) {
+    std::lock_guard<std::mutex> lock(mu_);
+    *listing = &h->listing;
+    if (h->filled && !rewind) return 0;
+    std::vector<DirEntry> &l = h->listing;
+    l.clear();
+    if (h->ino == kControlIno) {
+        l.push_back(DirEntry{".", kControlIno, S_IFDIR});
+        l.push_back(DirEntry{"..", kRootIno, S_IFDIR});
+        for (size_t i = 0; i < sizeof(kControlFiles) / sizeof(kControlFiles[0]); ++i)
+            l.push_back(DirEntry{kControlFiles[i], kControlIno + 1 + i, S_IFREG});
+    } else {
+        Node *dir = nullptr;
+        int err = DirByIno(h->ino, &dir);
+        if (err != 0) return -err;
+        l.push_back(DirEntry{".", dir->ino, S_IFDIR});
+        l.push_back(DirEntry{"..", dir->parent != nullptr ? dir->parent->ino : kRootIno, S_IFDIR});
+        for (size_t i = 0; i < dir->kind->attrs.size(); ++i)
+            l.push_back(DirEntry{dir->kind->attrs[i].name, dir->ino + 1 + i, S_IFREG});
+        for (auto &c : dir->children)
+            l.push_back(DirEntry{c.first, c.second->ino, static_cast<mode_t>(c.second->IsLink() ? S_IFLNK : S_IFDIR)});
+    }
+    h->filled = true;
+    return 0;
+}
+
+std::vector<Invalidation> Sim::TakeInvalidations() {
+    std::lock_guard<std::mutex> lock(mu_);
+    std::vector<Invalidation> v;
     v.swap(invalidations_);
     return v;
 }
 
 // ---- The control directory ----------------------------------------------------------
 
-int Sim::ControlOpen(const std::string &name, std::unique_ptr<Handle> *h) {
-    for (const char *f : kControlFiles)
-        if (name == f) {
-            h->reset(new Handle);
-            (*h)->control = name;
-            (*h)->path = "/.sim/" + name;
-            return 0;
-        }
-    return name.empty() ? -EISDIR : -ENOENT;
+int Sim::ControlOpen(uint64_t ino, Handle **h) {
+    if (ino == kControlIno) return -EISDIR;
+    if (ino <= kControlIno || ino > kControlIno + sizeof(kControlFiles) / sizeof(kControlFiles[0])) return -ENOENT;
+    *h = NewHandle();
+    (*h)->control = kControlFiles[ino - kControlIno - 1];
+    (*h)->writeMayWait = true;
+    (*h)->path = "/.sim/" + (*h)->control;
+    return 0;
 }
 
 int Sim::ControlRead(Handle *h) {
