@@ -159,9 +159,6 @@ struct Handle {
     bool filled = false;
     std::string content;  // what show produced at the first read
     std::string path;
-    // Writes may wait on the kernel: control commands (a module removal invalidates the
-    // kernel's entries) and stores with side effects (they open host paths).
-    bool writeMayWait = false;
     std::vector<DirEntry> listing;  // directories: the names as of the first readdir
     std::list<Handle>::iterator self;
 };

@@ -11,10 +11,10 @@
  * caller for a while and runs elsewhere.  Several reading threads would not do: the
  * kernel hands each request to whichever thread has waited longest.
  *
- * A request whose answer may wait on the kernel (an invalidation, or a store that
- * opens a host path, which may lead back into this mount) must not hold up the reading
- * thread, or the kernel's own request in between would never be read: handlers pass
- * such work to Defer, which runs it on a helper thread.
+ * A request whose answer waits on the kernel (an invalidation waits for the kernel's
+ * lock on the directory, which a caller may hold while it waits for an answer of ours)
+ * must not hold up the reading thread, or the request it waits for would never be
+ * read: handlers pass such work to Defer, which runs it on a helper thread.
  *
  * Run is called once, from the thread that owns the loop; Served and Defer are called
  * by request handlers, Served only on the reading thread.

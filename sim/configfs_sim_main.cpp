@@ -184,11 +184,13 @@ void Write(fuse_req_t req, Sim *sim, Handle *h, const char *buf, size_t size) {
 void SimWrite(fuse_req_t req, fuse_ino_t, const char *buf, size_t size, off_t, struct fuse_file_info *fi) {
     Sim *sim = TheSim(req);
     Handle *h = H(fi);
-    if (!h->writeMayWait) {
+    if (h->control.empty()) {
         Write(req, sim, h, buf, size);
         return;
     }
-    // The bytes live only as long as this call: the helper gets its own copy.
+    // A control command may end in invalidations, which wait for the kernel's lock on
+    // the directory: a helper sends them while this thread goes on answering whoever
+    // holds that lock.  The bytes live only as long as this call: the helper gets a copy.
     std::string data(buf, size);
     g_settings.loop->Defer([req, sim, h, data] { Write(req, sim, h, data.data(), data.size()); });
 }

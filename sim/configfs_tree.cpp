@@ -525,7 +525,6 @@ int Sim::Open(uint64_t ino, int flags, Handle **h) {
     (*h)->ino = r.node->ino;
     (*h)->attr = r.attr;
     (*h)->path = std::move(path);
-    (*h)->writeMayWait = r.node->kind->attrs[static_cast<size_t>(r.attr)].store != nullptr;
     return 0;
 }
 
@@ -645,7 +644,6 @@ int Sim::ControlOpen(uint64_t ino, Handle **h) {
     if (ino <= kControlIno || ino > kControlIno + sizeof(kControlFiles) / sizeof(kControlFiles[0])) return -ENOENT;
     *h = NewHandle();
     (*h)->control = kControlFiles[ino - kControlIno - 1];
-    (*h)->writeMayWait = true;
     (*h)->path = "/.sim/" + (*h)->control;
     return 0;
 }

@@ -10,6 +10,7 @@
 
 #include <cerrno>
 #include <chrono>
+#include <cstdlib>
 #include <cstring>
 #include <fstream>
 #include <sstream>
@@ -19,14 +20,37 @@ namespace orlotest {
 
 namespace {
 
-bool WaitExited(pid_t pid, int timeoutMs) {
+// Waits up to timeoutMs for pid to end.  False when it still runs; true otherwise,
+// with its wait status in *status, or *known false when it was not this process's to
+// wait for.
+bool WaitExited(pid_t pid, int timeoutMs, int *status, bool *known) {
     for (int waited = 0; waited <= timeoutMs; waited += 5) {
-        int status = 0;
-        pid_t r = waitpid(pid, &status, WNOHANG);
-        if (r == pid || (r < 0 && errno == ECHILD)) return true;
+        pid_t r = waitpid(pid, status, WNOHANG);
+        if (r == pid) return true;
+        if (r < 0 && errno == ECHILD) {
+            *known = false;
+            return true;
+        }
         std::this_thread::sleep_for(std::chrono::milliseconds(5));
     }
     return false;
+}
+
+// A file for a simulator's standard error, beside the sandbox rather than in it.
+std::string NewStderrFile() {
+    const char *tmp = getenv("TMPDIR");
+    std::string path = std::string(tmp != nullptr && tmp[0] != '\0' ? tmp : "/tmp") + "/orlo-sim-stderr-XXXXXX";
+    int fd = mkstemp(&path[0]);
+    if (fd < 0) return std::string();
+    close(fd);
+    return path;
+}
+
+std::string Slurp(const std::string &path) {
+    std::ifstream in(path, std::ios::binary);
+    std::stringstream ss;
+    ss << in.rdbuf();
+    return ss.str();
 }
 
 std::string Unescape(const std::string &s) {
@@ -107,12 +131,22 @@ void ConfigfsSimTest::SetUp() {
     bytes << src.rdbuf();
     WriteFile("/sbin/insmod", bytes.str(), 0755);
     for (const std::string &m : AllModuleNames()) WriteFile("/lib/modules/" + m + ".ko", "");
-    pid_ = LaunchSim(root_, Mount());
-    ASSERT_GT(pid_, 0) << "orlo-configfs-sim did not come up at " << Mount();
+    stderrPath_ = NewStderrFile();
+    ASSERT_FALSE(stderrPath_.empty()) << "cannot make a file for the simulator's standard error";
+    pid_ = LaunchSim(root_, Mount(), stderrPath_);
+    ASSERT_GT(pid_, 0) << "orlo-configfs-sim did not come up at " << Mount() << "\n" << Slurp(stderrPath_);
 }
 
-pid_t ConfigfsSimTest::LaunchSim(const std::string &root, const std::string &mount) {
+pid_t ConfigfsSimTest::LaunchSim(const std::string &root, const std::string &mount, const std::string &stderrPath,
+                                 const std::vector<std::string> &extraArgs) {
     std::string prog = BuiltProgram("orlo-configfs-sim");
+    // Everything the child needs is made before fork: it only redirects and execs.
+    std::vector<std::string> args = {prog, "--root", root};
+    args.insert(args.end(), extraArgs.begin(), extraArgs.end());
+    args.push_back(mount);
+    std::vector<char *> argv;
+    for (std::string &a : args) argv.push_back(&a[0]);
+    argv.push_back(nullptr);
     pid_t parent = getpid();
     pid_t pid = fork();
     if (pid < 0) return -1;
@@ -121,7 +155,12 @@ pid_t ConfigfsSimTest::LaunchSim(const std::string &root, const std::string &mou
         // its loop and unmount.
         prctl(PR_SET_PDEATHSIG, SIGTERM);
         if (getppid() != parent) _exit(1);
-        execl(prog.c_str(), prog.c_str(), "--root", root.c_str(), mount.c_str(), static_cast<char *>(nullptr));
+        if (!stderrPath.empty()) {
+            int fd = open(stderrPath.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC, 0600);
+            if (fd < 0 || dup2(fd, STDERR_FILENO) < 0) _exit(126);
+            close(fd);
+        }
+        execv(prog.c_str(), argv.data());
         _exit(127);
     }
     struct stat st;
@@ -137,17 +176,83 @@ pid_t ConfigfsSimTest::LaunchSim(const std::string &root, const std::string &mou
     return -1;
 }
 
+std::string ConfigfsSimTest::EndProblem(int status, bool stopped, const std::string &errText) {
+    std::string why;
+    if (WIFEXITED(status) && WEXITSTATUS(status) != 0) {
+        why = "exited with status " + std::to_string(WEXITSTATUS(status));
+    } else if (WIFSIGNALED(status) && (stopped || WTERMSIG(status) != SIGKILL)) {
+        why = "was ended by signal " + std::to_string(WTERMSIG(status)) + " (" + strsignal(WTERMSIG(status)) + ")";
+    }
+    // What the sanitizers print: LeakSanitizer and AddressSanitizer reports, UBSan's.
+    for (const char *report : {"ERROR: LeakSanitizer", "ERROR: AddressSanitizer", ": runtime error: "}) {
+        if (errText.find(report) == std::string::npos) continue;
+        why += std::string(why.empty() ? "" : ", and ") + "reported \"" + report + "\"";
+        break;
+    }
+    if (why.empty()) return why;
+    return "orlo-configfs-sim " + why + "; its standard error:\n" + errText;
+}
+
+bool ConfigfsSimTest::AbortConnection(const std::string &mount) {
+    // mountinfo: ID PARENT MAJOR:MINOR ROOT MOUNTPOINT ...; a FUSE connection is named by
+    // the minor number of its device.
+    std::ifstream in("/proc/self/mountinfo");
+    std::string line, minor;
+    while (std::getline(in, line) && minor.empty()) {
+        std::istringstream ls(line);
+        std::string id, parent, dev, root, point;
+        ls >> id >> parent >> dev >> root >> point;
+        if (point == mount && dev.find(':') != std::string::npos) minor = dev.substr(dev.find(':') + 1);
+    }
+    if (minor.empty()) return false;
+    const std::string dir = "/sys/fs/fuse/connections";
+    std::string abortFile = dir + "/" + minor + "/abort";
+    if (access(abortFile.c_str(), W_OK) != 0) ::mount("fusectl", dir.c_str(), "fusectl", 0, nullptr);
+    int fd = open(abortFile.c_str(), O_WRONLY | O_CLOEXEC);
+    if (fd < 0) return false;
+    bool ok = write(fd, "1", 1) == 1;
+    close(fd);
+    return ok;
+}
+
 void ConfigfsSimTest::StopSim() {
     if (pid_ > 0) {
-        kill(pid_, SIGTERM);
-        if (!WaitExited(pid_, 5000)) {
-            kill(pid_, SIGKILL);
-            waitpid(pid_, nullptr, 0);
+        int status = 0;
+        bool known = true;
+        pid_t r = waitpid(pid_, &status, WNOHANG);
+        bool stopped = r == 0;
+        known = r == pid_ || stopped;
+        std::string late;
+        if (stopped) {
+            kill(pid_, SIGTERM);
+            // A sanitizer's leak check at exit takes its time.
+            if (!WaitExited(pid_, 10000, &status, &known)) {
+                kill(pid_, SIGKILL);
+                late = "did not stop within 10 s of SIGTERM; ";
+                // A thread waiting on a request to its own mount outlives SIGKILL.
+                if (!WaitExited(pid_, 2000, &status, &known) && AbortConnection(Mount()))
+                    late += "it was wedged, and its connection was aborted; ";
+                waitpid(pid_, &status, 0);
+            }
         }
         pid_ = -1;
+        std::string problem = EndProblem(known ? status : 0, stopped, Slurp(stderrPath_));
+        if (!late.empty() || !problem.empty()) ADD_FAILURE() << late << problem;
+    }
+    if (!stderrPath_.empty()) {
+        unlink(stderrPath_.c_str());
+        stderrPath_.clear();
     }
     // A simulator that was killed leaves a dead mount behind: detach it.
     if (!root_.empty() && MountedAt(Mount())) umount2(Mount().c_str(), MNT_DETACH);
+}
+
+void ConfigfsSimTest::RestartSim(const std::vector<std::string> &extraArgs) {
+    StopSim();
+    stderrPath_ = NewStderrFile();
+    ASSERT_FALSE(stderrPath_.empty());
+    pid_ = LaunchSim(root_, Mount(), stderrPath_, extraArgs);
+    ASSERT_GT(pid_, 0) << "orlo-configfs-sim did not come up at " << Mount() << "\n" << Slurp(stderrPath_);
 }
 
 void ConfigfsSimTest::TearDown() {

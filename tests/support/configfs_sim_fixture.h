@@ -5,8 +5,11 @@
 // module of both target generations, so the library's module loading runs as on the
 // appliance.  The simulator is always unmounted: in TearDown (also after a failed
 // assertion), and by the simulator itself when the test process dies (it gets SIGTERM
-// through PR_SET_PDEATHSIG and leaves its FUSE loop cleanly).  Tests skip with a
-// message when not run as root or when /dev/fuse is missing.
+// through PR_SET_PDEATHSIG and leaves its FUSE loop cleanly).  Its standard error goes
+// to a file of its own, and the test fails when the simulator, once stopped, did not
+// exit with status 0 or wrote a sanitizer's report (a leak, a memory error, undefined
+// behaviour).  Tests skip with a message when not run as root or when /dev/fuse is
+// missing.
 #ifndef ORLO_TESTS_SUPPORT_CONFIGFS_SIM_FIXTURE_H
 #define ORLO_TESTS_SUPPORT_CONFIGFS_SIM_FIXTURE_H
 
@@ -32,9 +35,21 @@ class ConfigfsSimTest : public SandboxTest {
     // True when some file system is mounted exactly at path.
     static bool MountedAt(const std::string &path);
     // Starts a simulator on mount (appliance paths resolved under root) that ends when
-    // the calling thread's process dies, and waits until it serves requests.  Its pid,
-    // or -1 when it did not come up.
-    static pid_t LaunchSim(const std::string &root, const std::string &mount);
+    // the calling thread's process dies, and waits until it serves requests.  Its
+    // standard error goes to stderrPath when one is given; extraArgs are added to its
+    // options.  Its pid, or -1 when it did not come up.
+    static pid_t LaunchSim(const std::string &root, const std::string &mount, const std::string &stderrPath = "",
+                           const std::vector<std::string> &extraArgs = {});
+    // What was wrong with how a simulator ended, or "" when nothing was: status is its
+    // wait status, stopped tells whether it was still running when it was told to stop
+    // (one that died before may only have been killed with SIGKILL, as tests do), and
+    // errText is what it wrote on standard error.
+    static std::string EndProblem(int status, bool stopped, const std::string &errText);
+    // Aborts the FUSE connection of the file system mounted at mount (through the fuse
+    // control file system, mounted when it is not), so that every request waiting on a
+    // wedged simulator fails with ENOTCONN and the simulator itself can end.  True when
+    // the connection was found and aborted.
+    static bool AbortConnection(const std::string &mount);
 
   protected:
     // Module sets, numbered as the service numbers them.
@@ -73,12 +88,16 @@ class ConfigfsSimTest : public SandboxTest {
     std::string Cfg(const std::string &inside) const { return Real("/config") + inside; }
 
     pid_t sim_pid() const { return pid_; }
-    // Stops the simulator (SIGTERM, then SIGKILL after a grace period) and makes sure
-    // nothing stays mounted.  Safe to call twice.
+    // Stops the simulator (SIGTERM, then SIGKILL after a grace period, then an aborted
+    // connection when it is wedged in a request to itself) and makes sure nothing stays
+    // mounted; adds a test failure when it ended badly (EndProblem).  Safe to call twice.
     void StopSim();
+    // Stops the simulator and mounts a fresh one started with extraArgs.
+    void RestartSim(const std::vector<std::string> &extraArgs);
 
   private:
     pid_t pid_ = -1;
+    std::string stderrPath_;  // the running simulator's standard error
 };
 
 }  // namespace orlotest
