@@ -111,9 +111,11 @@ inline bool Put(const std::string &path, const char *value) {
 }
 
 // The main of a benchmark that needs the simulator: skips without root or /dev/fuse,
-// starts it, lets prepare(sim) fill the sandbox, runs the benchmarks and stops it.
+// starts it, lets prepare(sim) fill the sandbox, runs the benchmarks (shown by display
+// when one is given, else by the library's reporter) and stops it.
 template <typename Prepare>
-int Main(int argc, char **argv, const char *who, std::initializer_list<const char *> dirs, Prepare prepare) {
+int Main(int argc, char **argv, const char *who, std::initializer_list<const char *> dirs, Prepare prepare,
+         benchmark::BenchmarkReporter *display = nullptr) {
     if (geteuid() != 0 || access("/dev/fuse", R_OK | W_OK) != 0) {
         fprintf(stderr, "%s: needs root and /dev/fuse to mount the simulator; skipped\n", who);
         return 0;
@@ -125,7 +127,10 @@ int Main(int argc, char **argv, const char *who, std::initializer_list<const cha
             fprintf(stderr, "%s: could not prepare the sandbox\n", who);
         } else {
             benchmark::Initialize(&argc, argv);
-            benchmark::RunSpecifiedBenchmarks();
+            if (display != nullptr)
+                benchmark::RunSpecifiedBenchmarks(display);
+            else
+                benchmark::RunSpecifiedBenchmarks();
             benchmark::Shutdown();
             rc = 0;
         }
