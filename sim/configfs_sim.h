@@ -210,7 +210,6 @@ class Sim {
     // offset 0) and kept for the later reads of the same open.
     int ReadDir(Handle *h, bool rewind, const std::vector<DirEntry> **listing);
     void Release(Handle *h);
-    size_t OpenHandles();
 
     // Entries the kernel must drop (trees taken away by a module removal); the FUSE
     // glue calls this after each control write.

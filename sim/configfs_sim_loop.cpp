@@ -5,6 +5,8 @@
 #include "configfs_sim_loop.h"
 
 #include <fcntl.h>
+#include <pthread.h>
+#include <signal.h>
 #include <unistd.h>
 
 #include <cstdio>
@@ -32,7 +34,13 @@ RequestLoop::RequestLoop(struct fuse_session *se, unsigned helpers, bool follow)
     CPU_ZERO(&allowed_);
     if (follow_ && sched_getaffinity(0, sizeof(allowed_), &allowed_) != 0) follow_ = false;
     if (helpers == 0) helpers = 1;
+    // Signals are for the reading thread: SIGTERM must interrupt its read to end the
+    // loop, so the helpers start with every signal blocked.
+    sigset_t all, old;
+    sigfillset(&all);
+    pthread_sigmask(SIG_BLOCK, &all, &old);
     for (unsigned i = 0; i < helpers; ++i) helpers_.emplace_back(&RequestLoop::Helper, this);
+    pthread_sigmask(SIG_SETMASK, &old, nullptr);
 }
 
 RequestLoop::~RequestLoop() {

@@ -502,11 +502,6 @@ void Sim::Release(Handle *h) {
     handles_.erase(h->self);
 }
 
-size_t Sim::OpenHandles() {
-    std::lock_guard<std::mutex> lock(mu_);
-    return handles_.size();
-}
-
 int Sim::Open(uint64_t ino, int flags, Handle **h) {
     std::lock_guard<std::mutex> lock(mu_);
     Resolved r;
