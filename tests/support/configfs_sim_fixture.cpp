@@ -218,10 +218,9 @@ bool ConfigfsSimTest::AbortConnection(const std::string &mount) {
 void ConfigfsSimTest::StopSim() {
     if (pid_ > 0) {
         int status = 0;
-        bool known = true;
         pid_t r = waitpid(pid_, &status, WNOHANG);
         bool stopped = r == 0;
-        known = r == pid_ || stopped;
+        bool known = r == pid_ || stopped;
         std::string late;
         if (stopped) {
             kill(pid_, SIGTERM);
@@ -230,9 +229,10 @@ void ConfigfsSimTest::StopSim() {
                 kill(pid_, SIGKILL);
                 late = "did not stop within 10 s of SIGTERM; ";
                 // A thread waiting on a request to its own mount outlives SIGKILL.
-                if (!WaitExited(pid_, 2000, &status, &known) && AbortConnection(Mount()))
-                    late += "it was wedged, and its connection was aborted; ";
-                waitpid(pid_, &status, 0);
+                if (!WaitExited(pid_, 2000, &status, &known)) {
+                    if (AbortConnection(Mount())) late += "it was wedged, and its connection was aborted; ";
+                    if (!WaitExited(pid_, 5000, &status, &known)) late += "it could not be ended; ";
+                }
             }
         }
         pid_ = -1;
