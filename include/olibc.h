@@ -127,6 +127,25 @@ ORLO_EXPORT int OLIBCFileGetSectionValue(const char *path, const char *section, 
 /* 1 when the line (without its newline) is a section header "[name]", else 0. */
 ORLO_EXPORT int OLIBCIFileIsSection(const char *line, size_t length);
 
+/* ---- Line files: one entry per line, no sections (the snapshot application keys).  A
+ * line is what stands before its newline; the last line may lack one.  A missing file
+ * counts as an empty one.  Writers replace the file atomically like the section writers
+ * and refuse a symbolic link at the path (OLIBC_ERR_FOPEN). ---- */
+#define OLIBC_FILE_LINE_MAX 512  /* longest line a writer adds, its newline included */
+/* The number (from 1) of the first line equal to line, 0 when none is, negative on failure. */
+ORLO_EXPORT int OLIBCFileMatchLineNo(const char *path, const char *line);
+/* Appends line and a newline (after a newline when the last line lacks one), creating the
+ * file (0644) when missing.  A line holding "\n" or "\r", or longer than
+ * OLIBC_FILE_LINE_MAX - 1 bytes, is refused (OLIBC_ERR_BAD_PARAM).  0 or negative. */
+ORLO_EXPORT int OLIBCFileAddLine(const char *path, const char *line);
+/* Removes every line equal to line.  The number removed (0 leaves the file as it is), or
+ * negative. */
+ORLO_EXPORT int OLIBCFileRemoveLine(const char *path, const char *line);
+/* Appends every line of the file to *ppList (allocating it when NULL), each as it stands
+ * with its newline.  The number of lines, or negative (a list allocated here is freed
+ * again, one passed in keeps what it held). */
+ORLO_EXPORT int OLIBCFileReadLines(const char *path, POLIBC_SZLIST *ppList);
+
 /* ---- Lock files: advisory locks on a file of their own ---- */
 /* Creates the lock file (0600, not following symbolic links) if needed and locks it,
  * shared or exclusive, waiting up to timeoutSec seconds (-1: for ever, 0: not at all).
