@@ -142,20 +142,4 @@ TEST_F(SnapshotIdentityTest, UuidGenerateGivesFreshUuidsAndSearchesTheCacheNamed
     EXPECT_EQ(18990003u, ORLOiSCSISnapshotUuidGenerate(nullptr));
 }
 
-TEST_F(SnapshotIdentityTest, IsNameUsedComparesWholeNames) {
-    std::string text;
-    for (int sid = 1; sid <= 2; ++sid) text += SectionText(MakeSnap(3, sid));
-    WriteFile("/volume1/x.conf", text);
-    ORLOiSCSISnapshotFilter all = {};
-    ASSERT_EQ(0u, ORLOiSCSISnapshotConfLoadWithPath(&all, &list_, "/volume1/x.conf"));
-    bool used = true;
-    ASSERT_EQ(0u, ORLOiSCSISnapshotIsNameUsed(&list_, "SnapShot-2", &used));
-    EXPECT_TRUE(used);
-    ASSERT_EQ(0u, ORLOiSCSISnapshotIsNameUsed(&list_, "SnapShot-", &used));
-    EXPECT_FALSE(used);
-    ASSERT_EQ(0u, ORLOiSCSISnapshotIsNameUsed(&list_, "snapshot-2", &used));
-    EXPECT_FALSE(used);
-    EXPECT_EQ(18990003u, ORLOiSCSISnapshotIsNameUsed(&list_, nullptr, &used));
-}
-
 }  // namespace
