@@ -12,6 +12,7 @@
 
 #include <sys/types.h>
 
+#include "olibc.h"
 #include "orlo_export.h"
 
 ORLO_EXTERN_C_BEGIN
@@ -41,6 +42,9 @@ ORLO_EXPORT int ORLOBtrfsCreateSubVol(const char *path);
 /* Deletes the subvolume at path, its nested subvolumes first; a path already gone is
  * success.  0 or -1. */
 ORLO_EXPORT int ORLOBtrfsDeleteSubvolFaultTolerant(const char *path);
+/* ORLOBtrfsDeleteSubvolFaultTolerant on "<dir>/<name>" for every name of the list; every
+ * one is tried.  0, or -1 with the first failure's error. */
+ORLO_EXPORT int ORLOBtrfsDeleteSubvolListFaultTolerant(const char *dir, const OLIBC_SZLIST *names);
 /* 1 when path is the root of a Btrfs subvolume, 0 when not, -1 on failure. */
 ORLO_EXPORT int ORLOBtrfsIsSubVol(const char *path);
 /* Snapshots subvolume src as dst, read-only when readOnly is set.  0 or -1. */

@@ -71,6 +71,7 @@ ORLO_EXTERN_C_BEGIN
 #define ORLO_ISCSI_LUN_STATE_EP_UNMAP 0x1u    /* map file under "<volume>/@iSCSI/EP_unmap" */
 #define ORLO_ISCSI_LUN_STATE_KEEP_VOLUME_CONF 0x2u /* do not touch the volume's copy on removal */
 #define ORLO_ISCSI_LUN_STATE_UNSYNC 0x4u      /* unsynchronised LUN (replication destination) */
+#define ORLO_ISCSI_LUN_STATE_LOCKED 0x10u     /* the caller holds the LUN's lock already */
 #define ORLO_ISCSI_LUN_STATE_TMP 0x20u        /* lives under "<volume>/@iSCSI/tmp" */
 
 /* The LUN record.  Strings are NUL-terminated inside their arrays. */

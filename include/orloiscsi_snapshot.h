@@ -255,6 +255,63 @@ ORLO_EXPORT uint32_t ORLOiSCSISnapshotLockedAppKeysGet(const ORLOiSCSISnapshot *
 /* Whether at least one key is registered. */
 ORLO_EXPORT uint32_t ORLOiSCSISnapshotIsLockedByApp(const ORLOiSCSISnapshot *snap, bool *locked);
 
+/* ---- Taking and deleting snapshots ----
+ * Advanced-family LUNs (every type with bits 0xF: ADV, SINK, VDISK_ADV, BKP_ADV) get "ADV"
+ * snapshots: a map file "<volume>/@iSCSI/Snapshot/ADV/<lun uuid>/<uuid>/<uuid>_00000" that
+ * the kernel fills by cloning the LUN's map file while the LUN stays online.  Block-family
+ * LUNs (bits 0x107: BLUN, VDISK_BLUN) get "BLUN" snapshots: a read-only Btrfs snapshot
+ * "<volume>/@iSCSI/Snapshot/BLUN/<lun uuid>/<uuid>" of the LUN's subvolume.  See
+ * docs/snapshots.md. */
+/* More conf_flags read by creation and deletion. */
+#define ORLO_ISCSI_SNAPSHOT_CONF_TRASH 0x01u       /* made for the trash (map file in EP_unmap) */
+#define ORLO_ISCSI_SNAPSHOT_CONF_NO_APP_KEY 0x04u  /* delete without the application-key check */
+#define ORLO_ISCSI_SNAPSHOT_CONF_SCHEDULE 0x08u    /* taken by a schedule */
+/* Takes a snapshot of lun.  The caller fills name (or leaves it empty for a free default
+ * name), note, taken_by, isAppConsistence, conf_flags and, if it wants, snapshot_time; the
+ * call completes the rest.  The LUN is locked for the call unless its stateFlags carry
+ * ORLO_ISCSI_LUN_STATE_LOCKED.  A block snapshot is "Healthy" on return.  An advanced one is
+ * recorded "Unhealthy" and finished by a background process that polls the kernel's clone
+ * every 3 seconds and turns it "Healthy" with its version and mapped size; that process
+ * holds the LUN's and the snapshot's locks until it ends (wait with
+ * ORLOiSCSISnapshotWaitUntilUnlock).  Refusals: 18990500 (another type of LUN, before any
+ * lock), 18990002 (space), 18990543 (the per-LUN limit), 18990513 (a name the LUN's
+ * snapshots have, or a bad name), 18990408 (application plug-ins). */
+ORLO_EXPORT uint32_t ORLOiSCSISnapshotCreate(ORLOiSCSILun *lun, ORLOiSCSISnapshot *snap);
+/* The read-only Btrfs snapshot of a block-family LUN; 18990058 when it exists. */
+ORLO_EXPORT uint32_t ORLOiSCSISnapshotObjectCreateBLUN(const ORLOiSCSILun *lun, const ORLOiSCSISnapshot *snap);
+/* The map file of an advanced snapshot, sized and stamped as a clone of the LUN's. */
+ORLO_EXPORT uint32_t ORLOiSCSISnapshotObjectCreateADV(const ORLOiSCSILun *lun, const ORLOiSCSISnapshot *snap);
+/* Application-consistent ways (the plug-ins quiesce and resume around the moment of the
+ * snapshot; engine is not used and may be NULL). */
+ORLO_EXPORT uint32_t ORLOiSCSISnapshotCreateBySubvol(const ORLOiSCSILun *lun, ORLOiSCSISnapshot *snap, void *engine);
+ORLO_EXPORT uint32_t ORLOiSCSISnapshotCreateByMirror(const ORLOiSCSILun *lun, ORLOiSCSISnapshot *snap, void *engine);
+/* The snapshot plug-ins in /usr/orlo/plugins/snapshot/app_consistent/: event -1 counts them
+ * (negative on failure), event 4 asks them to quiesce, event 5 to resume (with result);
+ * 0 or -1. */
+ORLO_EXPORT int ORLOiSCSISnapshotLunPlugInNotify(const ORLOiSCSILun *lun, const ORLOiSCSISnapshot *snap, int event,
+                                                 int result);
+/* Whether the LUN's volume has room for one more snapshot (see docs/snapshots.md). */
+ORLO_EXPORT bool ORLOiSCSISnapshotIsSpaceEnoughToCreate(const ORLOiSCSILun *lun);
+/* The directories of a LUN's snapshots on its volume. */
+ORLO_EXPORT uint32_t ORLOiSCSISnapshotMkdir(const ORLOiSCSISnapshot *snap);
+/* An advanced snapshot's backstore under the extent pool's host, named
+ * "LUN_<lun uuid>_SN_<uuid>" ("UNMAP_..." under the trash host for conf_flags 0x01,
+ * "UNSYNC_..." for 0x02); 0 when it is there already / gone already. */
+ORLO_EXPORT uint32_t ORLOiSCSISnapshotLoad(const ORLOiSCSISnapshot *snap);
+ORLO_EXPORT uint32_t ORLOiSCSISnapshotUnload(const ORLOiSCSISnapshot *snap);
+/* Deletes a snapshot; 18990540 while an application holds it (unless conf_flags has 0x04).
+ * deleter names who deletes it, for the event log (NULL for nobody in particular). */
+ORLO_EXPORT uint32_t ORLOiSCSISnapshotDelete(ORLOiSCSISnapshot *snap, const char *deleter);
+ORLO_EXPORT uint32_t ORLOiSCSISnapshotDeleteWithoutCheckingAppKey(ORLOiSCSISnapshot *snap, const char *deleter);
+/* Deletes every snapshot of the LUN and its snapshot file. */
+ORLO_EXPORT uint32_t ORLOiSCSISnapshotDeleteByLun(const ORLOiSCSILun *lun);
+/* Settles what a process killed half-way through a creation or deletion left: a snapshot
+ * object whose record is missing goes (with any cached copy of the record), a record
+ * whose object is missing goes; snapshots whose operation lock is held are left alone.
+ * The caller holds the LUN's lock (snapshot creation and LUN deletion run it themselves).
+ * The number of repairs, or -1 when the LUN's snapshots cannot be read. */
+ORLO_EXPORT int ORLOiSCSISnapshotRepair(const ORLOiSCSILun *lun);
+
 /* ---- Clone families ---- */
 
 /* Removes the clone relations of LUN lid (1..1024) on either side: its own entry as a

@@ -1,6 +1,7 @@
 // Deletes a LUN.  A LUN a target maps is refused, and so is one another operation
 // holds.  Under the LUN's lock: the backstore leaves the kernel (nothing is touched when
-// that fails), an advanced LUN's map file moves into its volume's extent-pool trash,
+// that fails), the LUN's snapshots are deleted, an advanced LUN's map file moves into its
+// volume's extent-pool trash,
 // the LUN's directory goes (a Btrfs subvolume with everything in it, otherwise its files
 // and then the directory), and so do its configuration sections and its lock file.
 // From the unload on, a failing step is logged and the others still run, so that a
@@ -21,6 +22,7 @@
 #include "orlo_storage.h"
 #include "orloiscsi_ep.h"
 #include "orloiscsi_file.h"
+#include "orloiscsi_snapshot.h"
 #include "platform/os_seam.h"
 
 namespace {
@@ -137,6 +139,16 @@ uint32_t DeleteLocked(ORLOiSCSILun *lun, bool *inTrash) {
         return ret;
     }
     uint32_t first = ORLO_OK;
+    // Its snapshots go first: their records name the LUN, and a block LUN's subvolume
+    // snapshots live beside its own.
+    if (ORLO_ISCSI_LUN_IS_FILE_BACKED(lun->type)) {
+        ret = ORLOiSCSISnapshotDeleteByLun(lun);
+        if (ret != ORLO_OK) {
+            ORLO_LOG_ERR("ORLOiSCSISnapshotDeleteByLun(%p) failed, err=%s", static_cast<void *>(lun),
+                         ORLOiSCSIErrStr(ret));
+            Remember(&first, ret);
+        }
+    }
     if (ORLO_ISCSI_LUN_IS_FILE_BACKED(lun->type)) {
         char mapPath[kPathSize] = "";
         bool keepMap = false;

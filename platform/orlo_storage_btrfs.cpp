@@ -230,6 +230,29 @@ ORLO_EXPORT int ORLOBtrfsDeleteSubvolFaultTolerant(const char *path) {
     return 0;
 }
 
+ORLO_EXPORT int ORLOBtrfsDeleteSubvolListFaultTolerant(const char *dir, const OLIBC_SZLIST *names) {
+    if (dir == nullptr || dir[0] == '\0' || names == nullptr) {
+        ORLO_STORAGE_FAIL(EINVAL, OLIBC_ERR_BAD_PARAM);
+        return -1;
+    }
+    // Every name is tried; the first failure is what the call reports.
+    int result = 0, savedErr = 0, savedCode = 0;
+    for (int i = 0; i < names->nItem; ++i) {
+        const char *name = OLIBCSzListGet(names, i);
+        if (name == nullptr || name[0] == '\0' || strchr(name, '/') != nullptr) continue;
+        std::string path = std::string(dir) + "/" + name;
+        if (ORLOBtrfsDeleteSubvolFaultTolerant(path.c_str()) != 0 && result == 0) {
+            result = -1;
+            savedErr = errno;
+            savedCode = OLIBCErrGet();
+        }
+    }
+    if (result != 0) {
+        ORLO_STORAGE_FAIL(savedErr, savedCode);
+    }
+    return result;
+}
+
 ORLO_EXPORT int ORLOBtrfsSnapshotCreate(const char *src, const char *dst, int readOnly) {
     std::string parent, name;
     if (src == nullptr || src[0] == '\0' || !orlo::storage::SplitPath(dst, &parent, &name)) {

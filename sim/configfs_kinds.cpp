@@ -160,22 +160,28 @@ std::function<int(Sim &, Node &, const std::string &)> SetChecked(const char *ke
 }
 
 std::function<int(Sim &, Node &, const std::string &)> StartRelation(const char *relation) {
-    return [relation](Sim &, Node &dev, const std::string &v) {
+    return [relation](Sim &sim, Node &dev, const std::string &v) {
         if (!IsUuid(v) || Param(dev, "ep_parent_name").empty()) return EINVAL;
         dev.clone = CloneState();
         dev.clone.relation = relation;
         dev.clone.parentName = Param(dev, "ep_parent_name");
         dev.clone.parentUuid = v;
         dev.clone.ongoing = true;
+        dev.clone.started = std::chrono::steady_clock::now();
+        EpRelationStarted(sim, dev);
         return 0;
     };
 }
 
-int Promote(Sim &, Node &dev, const std::string &v) {
+int Promote(Sim &sim, Node &dev, const std::string &v) {
     uint32_t one = 0;
     if (KStrToU32(v, &one) != 0 || one != 1 || dev.clone.relation != "mirror") return EINVAL;
+    // A mirror is split off in step: whatever it still lacked is copied at the split.
+    if (!dev.clone.synced) EpRelationDone(sim, dev);
     dev.clone.promoted = true;
     dev.clone.ongoing = false;
+    dev.clone.progress = 100;
+    EpRelationPromoted(sim, dev);
     return 0;
 }
 

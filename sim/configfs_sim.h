@@ -35,6 +35,9 @@
 #include <string>
 #include <unordered_map>
 #include <vector>
+#include <thread>
+#include <condition_variable>
+#include <chrono>
 
 namespace orlosim {
 
@@ -95,7 +98,10 @@ struct CloneState {
     std::string parentUuid;
     bool ongoing = false;
     bool promoted = false;
-    int progress = 0;  // percent
+    bool synced = false;  // the child's map file holds the parent's extents
+    int progress = 0;     // percent
+    std::chrono::steady_clock::time_point started;  // for --clone-rate
+    int startProgress = 0;
 };
 
 struct Node {
@@ -180,6 +186,7 @@ class Sim {
         std::string mountpoint;  // absolute; absolute link targets are taken relative to it
         std::string mountAlias;  // the mount point as given, when it differs from its real path
         size_t traceLimit = 1000000;
+        int cloneRate = 0;  // percent a second that clones and mirrors advance on their own
     };
     explicit Sim(const Options &o);
     ~Sim();
@@ -210,6 +217,12 @@ class Sim {
     // offset 0) and kept for the later reads of the same open.
     int ReadDir(Handle *h, bool rewind, const std::vector<DirEntry> **listing);
     void Release(Handle *h);
+
+    // Clones and mirrors advance on their own (--clone-rate): a thread looks at them ten
+    // times a second until the simulator is destroyed.
+    void StartRelationTicker();
+    // Advances every running relation by the clone rate and ends those that reach 100.
+    void Tick();
 
     // Entries the kernel must drop (trees taken away by a module removal); the FUSE
     // glue calls this after each control write.
@@ -273,7 +286,19 @@ class Sim {
     std::vector<Invalidation> invalidations_;
     std::list<Handle> handles_;  // every open file and directory
     time_t started_;
+    std::thread ticker_;
+    std::condition_variable tickerWake_;
+    bool tickerStop_ = false;
 };
+
+// What the extent-pool module writes into a child's map file (configfs_ep_relation.cpp):
+// a mirror child is marked so at its start; when a clone or mirror reaches its end the
+// child gets the parent's extents and counts, synced in full; a promoted mirror child is
+// marked stable.  Called with the model's mutex held; a map file that cannot be read or
+// written is left as it is (the library then sees the relation fail).
+void EpRelationStarted(Sim &sim, Node &dev);
+void EpRelationDone(Sim &sim, Node &dev);
+void EpRelationPromoted(Sim &sim, Node &dev);
 
 }  // namespace orlosim
 

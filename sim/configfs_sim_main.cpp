@@ -289,6 +289,8 @@ const char kUsage[] =
     "  --entry-timeout S   seconds the kernel may cache entries and attributes that\n"
     "                      exist (default 1); failed lookups are never cached\n"
     "  --no-follow         do not move the reading thread to its caller's CPU\n"
+    "  --clone-rate PCT    clones and mirrors advance PCT percent a second on their own\n"
+    "                      (default 0: only through MOUNTPOINT/.sim/clone)\n"
     "  -d, --daemon        detach once mounted\n"
     "  -h, --help          show this text\n"
     "\n"
@@ -308,6 +310,7 @@ int main(int argc, char **argv) {
         {"root", required_argument, nullptr, 'r'},        {"trace-limit", required_argument, nullptr, 't'},
         {"threads", required_argument, nullptr, 'n'},     {"entry-timeout", required_argument, nullptr, 'e'},
         {"no-follow", no_argument, nullptr, 'f'},         {"daemon", no_argument, nullptr, 'd'},
+        {"clone-rate", required_argument, nullptr, 'c'},
         {"help", no_argument, nullptr, 'h'},
         {nullptr, 0, nullptr, 0}};
     int c;
@@ -319,6 +322,7 @@ int main(int argc, char **argv) {
             case 'e': g_settings.entryTimeout = strtod(optarg, nullptr); break;
             case 'f': follow = false; break;
             case 'd': daemon = true; break;
+            case 'c': opts.cloneRate = static_cast<int>(strtol(optarg, nullptr, 10)); break;
             case 'h': fputs(kUsage, stdout); return 0;
             default: fputs(kUsage, stderr); return 2;
         }
@@ -383,6 +387,7 @@ int main(int argc, char **argv) {
             fprintf(stderr, "orlo-configfs-sim: cannot mount on %s\n", real);
         } else {
             if (fuse_daemonize(daemon ? 0 : 1) == 0) {
+                sim.StartRelationTicker();  // after the fork of --daemon, in the process that serves
                 orlosim::RequestLoop loop(se, threads - 1, follow);
                 g_settings.loop = &loop;
                 int end = loop.Run();

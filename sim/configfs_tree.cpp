@@ -115,7 +115,49 @@ Sim::Sim(const Options &o) : opts_(o), started_(time(nullptr)) {
     nextIno_ = 256;
 }
 
-Sim::~Sim() = default;
+Sim::~Sim() {
+    {
+        std::lock_guard<std::mutex> lock(mu_);
+        tickerStop_ = true;
+    }
+    tickerWake_.notify_all();
+    if (ticker_.joinable()) ticker_.join();
+}
+
+void Sim::StartRelationTicker() {
+    if (opts_.cloneRate <= 0 || ticker_.joinable()) return;
+    ticker_ = std::thread([this] {
+        std::unique_lock<std::mutex> lock(mu_);
+        while (!tickerStop_) {
+            tickerWake_.wait_for(lock, std::chrono::milliseconds(100));
+            if (tickerStop_) break;
+            lock.unlock();
+            Tick();
+            lock.lock();
+        }
+    });
+}
+
+void Sim::Tick() {
+    std::lock_guard<std::mutex> lock(mu_);
+    if (opts_.cloneRate <= 0) return;
+    const auto now = std::chrono::steady_clock::now();
+    std::vector<Node *> stack{root_.get()};
+    while (!stack.empty()) {
+        Node *n = stack.back();
+        stack.pop_back();
+        for (auto &c : n->children)
+            if (!c.second->IsLink()) stack.push_back(c.second.get());
+        CloneState &c = n->clone;
+        if (c.relation.empty() || !c.ongoing || c.synced) continue;
+        const long ms = static_cast<long>(std::chrono::duration_cast<std::chrono::milliseconds>(now - c.started).count());
+        const long pct = c.startProgress + ms * opts_.cloneRate / 1000;
+        c.progress = pct >= 100 ? 100 : static_cast<int>(pct);
+        if (c.progress < 100) continue;
+        if (c.relation == "clone") c.ongoing = false;
+        EpRelationDone(*this, *n);
+    }
+}
 
 Node *Sim::MakeNode(Node *parent, const std::string &name, const Kind *kind, bool user) {
     std::unique_ptr<Node> n(new Node);
@@ -768,7 +810,11 @@ int Sim::ControlCommand(const std::string &file, const std::string &line) {
             if (*end != '\0' || pct < 0 || pct > 100) return EINVAL;
             if (n->clone.relation.empty()) n->clone.relation = "clone";
             n->clone.progress = static_cast<int>(pct);
-            n->clone.ongoing = pct < 100;
+            n->clone.startProgress = n->clone.progress;
+            n->clone.started = std::chrono::steady_clock::now();
+            // A mirror stays in its relation when in step; a clone ends there.
+            n->clone.ongoing = pct < 100 || (n->clone.relation == "mirror" && !n->clone.promoted);
+            if (pct == 100 && !n->clone.synced) EpRelationDone(*this, *n);
             return 0;
         }
         if (w[0] == "stop" && w.size() == 2) {
