@@ -1,14 +1,18 @@
 // Cost of the configuration-file operations on a file of 1024 LUN-sized sections
 // (about 20 keys each, ~730 KB), each set against the floor of reading and parsing the
 // whole file once.  Every benchmark reports its own time and, as the counter
-// "x_floor", how many floors it costs; a summary table is printed at the end.  Writers
-// read the file once and write it once, so their ratio stays near 2.
+// "x_floor", how many floors it costs; a summary table is printed at the end, and every
+// operation must stay within 2x the floor.  Replacing a section reads the section
+// (through the parse cache, which finds the file's headers and parses that section's
+// lines only), then reads the file again, edits it and writes it once.
 //
 // The comparison runs on a memory file system (/dev/shm when there is one) so that it
 // measures the code and not the disk: a writer's fsync waits for the device, which
 // can cost anything from nothing to many times the whole parse.  That device cost is
 // shown apart, by BM_ReplaceOneSectionOnDisk and a direct fsync timing, and is not
-// held to the 3x limit.
+// held to the limit.  Each compared benchmark runs kRepetitions times and the table
+// takes the fastest repetition of each, floor included: on a machine shared with
+// other work the fastest run is the one least disturbed by it.
 //
 // Run: bench/section_file_bench [--benchmark_min_time=0.5]
 #include <benchmark/benchmark.h>
@@ -31,6 +35,8 @@
 namespace {
 
 constexpr int kSections = 1024;
+constexpr int kRepetitions = 5;
+constexpr double kLimit = 2.0;  // times the floor
 const char *const kConf = "/usr/orlo/etc/iscsi_lun.conf";
 
 std::string gRoot;      // memory file system: the compared runs
@@ -213,7 +219,8 @@ class RatioReporter : public benchmark::ConsoleReporter {
             if (r.run_type != Run::RT_Iteration || r.iterations == 0) continue;
             double seconds = r.real_accumulated_time / static_cast<double>(r.iterations);
             std::string name = r.run_name.function_name;
-            gSeconds[name] = seconds;
+            auto seen = gSeconds.find(name);
+            if (seen == gSeconds.end() || seconds < seen->second) gSeconds[name] = seconds;
             auto floor = gSeconds.find("BM_ReadAndParseFloor");
             if (floor != gSeconds.end() && floor->second > 0 && name.find("OnDisk") == std::string::npos)
                 r.counters["x_floor"] = benchmark::Counter(seconds / floor->second);
@@ -224,16 +231,16 @@ class RatioReporter : public benchmark::ConsoleReporter {
         ConsoleReporter::Finalize();
         auto floor = gSeconds.find("BM_ReadAndParseFloor");
         if (floor == gSeconds.end()) return;
-        printf("\n%-26s %12s %10s  (file of %d sections, limit 3.00)\n", "operation", "ms/op", "x floor",
-               kSections);
+        printf("\n%-26s %12s %10s  (file of %d sections, fastest of %d runs, limit %.2f)\n", "operation", "ms/op",
+               "x floor", kSections, kRepetitions, kLimit);
         bool within = true;
         for (const auto &kv : gSeconds) {
             if (kv.first.find("OnDisk") != std::string::npos) continue;
             double ratio = kv.second / floor->second;
-            if (kv.first != floor->first && ratio > 3.0) within = false;
+            if (kv.first != floor->first && ratio > kLimit) within = false;
             printf("%-26s %12.3f %10.2f\n", kv.first.c_str(), kv.second * 1e3, ratio);
         }
-        printf("%s\n", within ? "every operation within 3x the floor" : "SOME OPERATION EXCEEDS 3x THE FLOOR");
+        printf(within ? "every operation within %.0fx the floor\n" : "SOME OPERATION EXCEEDS %.0fx THE FLOOR\n", kLimit);
         auto disk = gSeconds.find("BM_ReplaceOneSectionOnDisk");
         if (disk != gSeconds.end())
             printf("on disk (%s): replacing one section takes %.3f ms, of which fsync of the file alone "
@@ -244,11 +251,11 @@ class RatioReporter : public benchmark::ConsoleReporter {
 
 }  // namespace
 
-BENCHMARK(BM_ReadAndParseFloor)->Unit(benchmark::kMillisecond)->UseRealTime();
-BENCHMARK(BM_Enumerate)->Unit(benchmark::kMillisecond)->UseRealTime();
-BENCHMARK(BM_GetOneSection)->Unit(benchmark::kMillisecond)->UseRealTime();
-BENCHMARK(BM_ReplaceOneSection)->Unit(benchmark::kMillisecond)->UseRealTime();
-BENCHMARK(BM_RemoveListOf100)->Unit(benchmark::kMillisecond)->UseRealTime();
+BENCHMARK(BM_ReadAndParseFloor)->Unit(benchmark::kMillisecond)->UseRealTime()->Repetitions(kRepetitions);
+BENCHMARK(BM_Enumerate)->Unit(benchmark::kMillisecond)->UseRealTime()->Repetitions(kRepetitions);
+BENCHMARK(BM_GetOneSection)->Unit(benchmark::kMillisecond)->UseRealTime()->Repetitions(kRepetitions);
+BENCHMARK(BM_ReplaceOneSection)->Unit(benchmark::kMillisecond)->UseRealTime()->Repetitions(kRepetitions);
+BENCHMARK(BM_RemoveListOf100)->Unit(benchmark::kMillisecond)->UseRealTime()->Repetitions(kRepetitions);
 BENCHMARK(BM_ReplaceOneSectionOnDisk)->Unit(benchmark::kMillisecond)->UseRealTime();
 
 // Makes a sandbox root with the configuration directory under base.

@@ -1,6 +1,6 @@
-// The per-thread cache of parsed section files: parsing one image, the lazily built
-// hashes, indexes and facts of a parse, and the small least-recently-used table that
-// ties each parse to the version of the file it came from.
+// The per-thread cache of parsed section files: finding the sections of one image, the
+// key lines, hashes, indexes and facts of a parse built at first use, and the small
+// least-recently-used table that ties each parse to the version of the file it came from.
 #include "platform/olibc_file_cache.h"
 
 #include <sys/stat.h>
@@ -37,52 +37,71 @@ SectionFile::~SectionFile() {
 
 void SectionFile::Parse(std::string data) {
     data_ = std::move(data);
-    strings_.clear();
     sections_.clear();
-    pairs_.clear();
     firstByName_.clear();
+    for (POLIBC_SZHASH h : hashes_) OLIBCSzHashFree(h);
+    hashes_.clear();
+    indexes_.clear();
+    facts_.clear();
     hasBadHeader_ = false;
     hasNulInName_ = false;
     if (data_.size() > UINT32_MAX / 2) throw std::bad_alloc();  // offsets are 32-bit
-    strings_.reserve(data_.size() + 1);
-    strings_.push_back('\0');  // offset 0: the empty name of a malformed header
-    auto store = [this](std::string_view s) {
-        uint32_t off = static_cast<uint32_t>(strings_.size());
-        strings_.append(s);
-        strings_.push_back('\0');
-        return off;
-    };
-    LineScanner scanner(data_);
-    Line line;
-    while (scanner.Next(&line)) {
-        if (line.kind == LineKind::kHeader || line.kind == LineKind::kBadHeader) {
-            Section s{};
-            s.badHeader = line.kind == LineKind::kBadHeader;
-            s.nameOff = s.badHeader ? 0 : store(line.name);
-            s.nameLen = static_cast<uint32_t>(line.name.size());
-            s.pairBegin = s.pairEnd = static_cast<uint32_t>(pairs_.size());
-            hasBadHeader_ = hasBadHeader_ || s.badHeader;
-            hasNulInName_ = hasNulInName_ || line.name.find('\0') != std::string_view::npos;
-            sections_.push_back(s);
-            continue;
-        }
-        if (sections_.empty()) continue;  // before the first header: no section's line
-        scanner.Parse(&line);
-        if (line.kind != LineKind::kKey) continue;
-        Pair p{};
-        p.keyOff = store(line.key);
-        p.valueOff = store(line.value);
-        pairs_.push_back(p);
-        sections_.back().pairEnd = static_cast<uint32_t>(pairs_.size());
-    }
-    // strings_ no longer grows: views into it stay valid.
-    firstByName_.reserve(sections_.size());
-    for (size_t i = 0; i < sections_.size(); ++i) {
-        Section &s = sections_[i];
-        if (s.badHeader) continue;
-        s.firstOfName = firstByName_.emplace(std::string_view(Name(i), s.nameLen), static_cast<uint32_t>(i)).second;
+    // What the strings of a file can take: a header line stores its name and a NUL, no
+    // more than the line's "[", "]" or newline; a key line stores key, NUL, value, NUL,
+    // no more than the line with its "=" and newline.  Only the last line may lack its
+    // newline (one byte more), and offset 0 holds the empty name of a malformed header.
+    // The buffer is left uninitialised: only the bytes written are ever touched.
+    capacity_ = data_.size() + 2;
+    strings_.reset(new char[capacity_]);
+    strings_[0] = '\0';
+    used_ = 1;
+    std::vector<Header> headers;
+    ScanHeaders(data_, &headers);
+    sections_.reserve(headers.size());
+    firstByName_.reserve(headers.size());
+    for (size_t i = 0; i < headers.size(); ++i) {
+        const Header &h = headers[i];
+        Section s{};
+        s.badHeader = h.name.empty();
+        s.nameOff = s.badHeader ? 0 : Store(h.name);
+        s.nameLen = static_cast<uint32_t>(h.name.size());
+        s.bodyBegin = static_cast<uint32_t>(h.end);
+        s.bodyEnd = static_cast<uint32_t>(BodyEnd(headers, i, data_.size()));
+        hasBadHeader_ = hasBadHeader_ || s.badHeader;
+        hasNulInName_ = hasNulInName_ || h.name.find('\0') != std::string_view::npos;
+        if (!s.badHeader) s.firstOfName = firstByName_.emplace(h.name, static_cast<uint32_t>(i)).second;
+        sections_.push_back(s);
     }
     hashes_.assign(sections_.size(), nullptr);
+}
+
+uint32_t SectionFile::Store(std::string_view s) const {
+    s = s.substr(0, s.find('\0'));
+    // The bound taken at load makes this hold; were it ever broken, the string would
+    // read empty rather than be written past the buffer.
+    if (used_ + s.size() + 1 > capacity_) return 0;
+    const uint32_t off = static_cast<uint32_t>(used_);
+    memcpy(strings_.get() + used_, s.data(), s.size());
+    strings_[used_ + s.size()] = '\0';
+    used_ += s.size() + 1;
+    return off;
+}
+
+const SectionFile::Section &SectionFile::Body(size_t i) const {
+    Section &s = sections_[i];
+    if (s.parsed) return s;
+    s.pairsOff = static_cast<uint32_t>(used_);
+    LineScanner body(data_, s.bodyBegin, s.bodyEnd);
+    Line line;
+    while (body.Next(&line)) {
+        body.Parse(&line);
+        if (line.kind != LineKind::kKey) continue;
+        Store(line.key);
+        Store(line.value);
+        ++s.pairCount;
+    }
+    s.parsed = true;
+    return s;
 }
 
 long SectionFile::Find(std::string_view name) const {
@@ -91,9 +110,11 @@ long SectionFile::Find(std::string_view name) const {
 }
 
 const char *SectionFile::ValueOf(size_t i, const char *key) const {
-    for (size_t k = PairCount(i); k-- > 0;)
-        if (strcmp(Key(i, k), key) == 0) return Value(i, k);
-    return nullptr;
+    const char *found = nullptr;
+    ForEachPair(i, [&](const char *k, const char *v) {
+        if (strcmp(k, key) == 0) found = v;
+    });
+    return found;
 }
 
 int SectionFile::CopyInto(size_t i, POLIBC_SZHASH *ppHash) const {
@@ -104,16 +125,18 @@ int SectionFile::CopyInto(size_t i, POLIBC_SZHASH *ppHash) const {
     } else {
         OLIBCSzHashRemoveAll(*ppHash);
     }
-    for (size_t k = 0; k < PairCount(i); ++k) {
-        if (OLIBCSzHashSetValue(ppHash, Key(i, k), Value(i, k)) != 0) {
-            if (ours) {
-                OLIBCSzHashFree(*ppHash);
-                *ppHash = nullptr;
-            } else {
-                OLIBCSzHashRemoveAll(*ppHash);
-            }
-            return -1;
+    bool failed = false;
+    ForEachPair(i, [&](const char *key, const char *value) {
+        if (!failed && OLIBCSzHashSetValue(ppHash, key, value) != 0) failed = true;
+    });
+    if (failed) {
+        if (ours) {
+            OLIBCSzHashFree(*ppHash);
+            *ppHash = nullptr;
+        } else {
+            OLIBCSzHashRemoveAll(*ppHash);
         }
+        return -1;
     }
     return 0;
 }

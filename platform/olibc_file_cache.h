@@ -17,11 +17,14 @@
  *
  * A SectionFile holds every header line of the file in file order (duplicates and
  * malformed headers included; lines before the first header belong to no section) with
- * the key lines of its body, exactly as the section readers parse them.  It is immutable
- * except for what it builds on first use (a section's hash, indexes, facts), and belongs
- * to the thread that loaded it: the library takes no in-process lock, and each thread has
- * a cache of its own.  Callers hold the file's lock file while they use a parse, as they
- * did when they read the file themselves.
+ * the key lines of its body, exactly as the section readers parse them.  Loading a file
+ * finds its headers only (a byte search for "[" at line starts); the key lines of a
+ * section are parsed when that section is first asked about.  A writer that reads one
+ * section and then replaces the file thus pays for the headers, not for every line.
+ * A parse is immutable except for what it builds on first use (a section's key lines,
+ * its hash, indexes, facts), and belongs to the thread that loaded it: the library takes
+ * no in-process lock, and each thread has a cache of its own.  Callers hold the file's
+ * lock file while they use a parse, as they did when they read the file themselves.
  *
  * Functions here never throw: a failed allocation sets OLIBC_ERR_OUT_OF_MEM and yields
  * nullptr (or false).
@@ -32,6 +35,7 @@
 #include <stddef.h>
 #include <stdint.h>
 
+#include <cstring>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -65,8 +69,9 @@ class SectionFile {
     const std::string &Data() const { return data_; }
     // Header lines, in file order.
     size_t Count() const { return sections_.size(); }
-    // The name (NUL-terminated; "" for a malformed header).
-    const char *Name(size_t i) const { return strings_.data() + sections_[i].nameOff; }
+    // The name (NUL-terminated, so cut at a NUL byte it may hold; "" for a malformed
+    // header).
+    const char *Name(size_t i) const { return strings_.get() + sections_[i].nameOff; }
     size_t NameLength(size_t i) const { return sections_[i].nameLen; }
     bool IsBadHeader(size_t i) const { return sections_[i].badHeader; }
     // Whether no earlier header has this section's name: the section that name-based
@@ -79,11 +84,21 @@ class SectionFile {
     // The first section named name, or -1.
     long Find(std::string_view name) const;
 
-    // Key lines of section i in file order, duplicates included (NUL-terminated copies).
-    size_t PairCount(size_t i) const { return sections_[i].pairEnd - sections_[i].pairBegin; }
-    const char *Key(size_t i, size_t k) const { return strings_.data() + pairs_[sections_[i].pairBegin + k].keyOff; }
-    const char *Value(size_t i, size_t k) const {
-        return strings_.data() + pairs_[sections_[i].pairBegin + k].valueOff;
+    // The number of key lines of section i, duplicates included.
+    size_t PairCount(size_t i) const { return Body(i).pairCount; }
+    // Calls visit(key, value) for each key line of section i in file order, duplicates
+    // included (NUL-terminated copies, cut at a NUL byte the file may hold).
+    template <typename Visit>
+    void ForEachPair(size_t i, Visit visit) const {
+        const Section &s = Body(i);
+        const char *p = strings_.get() + s.pairsOff;
+        for (uint32_t k = 0; k < s.pairCount; ++k) {
+            const char *key = p;
+            p += strlen(p) + 1;
+            const char *value = p;
+            p += strlen(p) + 1;
+            visit(key, value);
+        }
     }
     // What the section's hash holds for key (the last line of the key), or nullptr.
     const char *ValueOf(size_t i, const char *key) const;
@@ -107,22 +122,31 @@ class SectionFile {
     struct Section {
         uint32_t nameOff;
         uint32_t nameLen;
-        uint32_t pairBegin;
-        uint32_t pairEnd;
+        uint32_t bodyBegin;  // the body's lines: [bodyBegin, bodyEnd) of data_
+        uint32_t bodyEnd;
+        uint32_t pairsOff;   // once parsed: "key\0value\0" per key line in strings_
+        uint32_t pairCount;
         bool badHeader;
         bool firstOfName;
+        bool parsed;
     };
-    struct Pair {
-        uint32_t keyOff;
-        uint32_t valueOff;
-    };
+
+    // Section i with its key lines parsed (at first use).  Never fails: the string
+    // buffer is sized at load for every line of the file.
+    const Section &Body(size_t i) const;
+    // Copies s (up to a NUL byte in it) into strings_ with a terminating NUL; its offset.
+    uint32_t Store(std::string_view s) const;
+
     using Index = std::unordered_map<int64_t, std::vector<uint32_t>>;
 
     std::string data_;
-    std::string strings_;  // names, keys and values, each NUL-terminated
-    std::vector<Section> sections_;
-    std::vector<Pair> pairs_;
-    std::unordered_map<std::string_view, uint32_t> firstByName_;
+    // Names, keys and values, each NUL-terminated.  Sized at load so that every line of
+    // the file fits once: it never moves, and the strings handed out stay valid.
+    mutable std::unique_ptr<char[]> strings_;
+    mutable size_t used_ = 0;
+    size_t capacity_ = 0;
+    mutable std::vector<Section> sections_;
+    std::unordered_map<std::string_view, uint32_t> firstByName_;  // names as data_ holds them
     bool hasBadHeader_ = false;
     bool hasNulInName_ = false;
     mutable std::vector<POLIBC_SZHASH> hashes_;

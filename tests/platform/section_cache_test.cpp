@@ -280,6 +280,59 @@ TEST_F(SectionCacheTest, OddLinesAndDuplicateHeadersReadAsBefore) {
     EXPECT_EQ((std::vector<std::string>{"<error>"}), names(0x1001, 1));
 }
 
+// A section's key lines are parsed when it is first asked about: whatever the order of the
+// questions, each section reads as a fresh parse read in file order does, and what was
+// handed out earlier stays where it was (it is never moved by a later section's parse).
+// The file ends in a key line without a newline, the case that fills the parse's string
+// buffer most; NUL bytes cut a key or value as a C string, without upsetting the pairs
+// after them.
+TEST_F(SectionCacheTest, KeyLinesParsedAtFirstUseReadAlikeInAnyOrder) {
+    std::string text = "[a]\n\tk=1\n\tk=2\n[b]\r\n\tx = \"q\"\r\n";
+    const char withNul[] = "[n\0ul]\n\tke\0y=va\0lue\n\tafter=ok\n";
+    text.append(withNul, sizeof(withNul) - 1);
+    for (int i = 0; i < 40; ++i) text += "[s" + std::to_string(i) + "]\n\tv=" + std::to_string(i) + "\n";
+    text += "[last]\n\tk=v\n\tend=z";
+    WriteFile(kConf, text);
+
+    using orlo::olibc::SectionFile;
+    auto pairsOf = [](const SectionFile &f, size_t i) {
+        Pairs out;
+        f.ForEachPair(i, [&out](const char *k, const char *v) { out.emplace_back(k, v); });
+        return out;
+    };
+    std::shared_ptr<const SectionFile> forward = orlo::olibc::SectionFileLoad(kConf);
+    ASSERT_NE(nullptr, forward);
+    std::vector<Pairs> inOrder;
+    for (size_t i = 0; i < forward->Count(); ++i) inOrder.push_back(pairsOf(*forward, i));
+    ASSERT_EQ(44u, inOrder.size());
+    EXPECT_EQ((Pairs{{"k", "1"}, {"k", "2"}}), inOrder[0]);
+    EXPECT_EQ((Pairs{{"x", "q"}}), inOrder[1]);
+    EXPECT_STREQ("n", forward->Name(2));
+    EXPECT_EQ((Pairs{{"ke", "va"}, {"after", "ok"}}), inOrder[2]);
+    EXPECT_EQ((Pairs{{"v", "39"}}), inOrder[42]);
+    EXPECT_EQ((Pairs{{"k", "v"}, {"end", "z"}}), inOrder[43]);
+
+    orlo::olibc::SectionFileCacheClear();
+    std::shared_ptr<const SectionFile> file = orlo::olibc::SectionFileLoad(kConf);
+    ASSERT_NE(nullptr, file);
+    ASSERT_NE(forward.get(), file.get());
+    const char *end = file->ValueOf(43, "end");
+    ASSERT_NE(nullptr, end);
+    const char *name = file->Name(43);
+    for (size_t i = file->Count(); i-- > 0;) EXPECT_EQ(inOrder[i], pairsOf(*file, i)) << i;
+    EXPECT_EQ(end, file->ValueOf(43, "end"));  // the same string, not a copy of it
+    EXPECT_STREQ("z", end);
+    EXPECT_EQ(name, file->Name(43));
+    EXPECT_STREQ("2", file->ValueOf(0, "k"));
+    EXPECT_EQ(nullptr, file->ValueOf(2, "key"));
+    EXPECT_EQ((Pairs{{"k", "v"}, {"end", "z"}}), Get("last"));
+
+    // Every byte stored: a header without "]" and key lines without blanks, the last one
+    // without its newline.
+    WriteFile(kConf, "[t\na=1\nb=2\nc=3");
+    EXPECT_EQ((Pairs{{"a", "1"}, {"b", "2"}, {"c", "3"}}), Get("t"));
+}
+
 TEST_F(SectionCacheTest, WritingTheSameBytesLeavesTheFileAsItIs) {
     POLIBC_SZHASH h = MakeHash({{"k", "1"}, {"v", "two"}});
     ASSERT_EQ(0, OLIBCFileTouch(kConf));
