@@ -13,7 +13,7 @@ JOBS       ?= $(shell nproc 2>/dev/null || echo 2)
 PREFIX     ?= /usr/local
 
 DEB_PACKAGES = build-essential cmake pkg-config libgtest-dev libgmock-dev libbenchmark-dev \
-               libjson-c-dev libssl-dev uuid-dev libcrypt-dev libfuse3-dev fuse3 \
+               libjson-c-dev libssl-dev uuid-dev libcrypt-dev zlib1g-dev libfuse3-dev fuse3 \
                libcli11-dev btrfs-progs e2fsprogs util-linux libisns-dev open-isns-server open-isns-utils \
                iproute2
 
