@@ -10,9 +10,10 @@
 // measures the code and not the disk: a writer's fsync waits for the device, which
 // can cost anything from nothing to many times the whole parse.  That device cost is
 // shown apart, by BM_ReplaceOneSectionOnDisk and a direct fsync timing, and is not
-// held to the limit.  Each compared benchmark runs kRepetitions times and the table
-// takes the fastest repetition of each, floor included: on a machine shared with
-// other work the fastest run is the one least disturbed by it.
+// held to the limit.  Each compared benchmark runs kRepetitions times, the repetitions
+// of all of them interleaved at random, and the table takes the fastest repetition of
+// each, floor included: on a machine shared with other work the fastest run is the one
+// least disturbed by it.
 //
 // Run: bench/section_file_bench [--benchmark_min_time=0.5]
 #include <benchmark/benchmark.h>
@@ -275,7 +276,14 @@ int main(int argc, char **argv) {
     setenv("ORLO_SYSROOT", gRoot.c_str(), 1);
     BuildFile(gRoot);
     BuildFile(gDiskRoot);
-    benchmark::Initialize(&argc, argv);
+    // Repetitions of the compared benchmarks run in a random interleaving, so that the
+    // floor and each operation sample the same stretches of a busy machine (a flag given
+    // on the command line comes later and wins).
+    std::vector<char *> args(argv, argv + argc);
+    char interleave[] = "--benchmark_enable_random_interleaving=true";
+    args.insert(args.begin() + 1, interleave);
+    int count = static_cast<int>(args.size());
+    benchmark::Initialize(&count, args.data());
     RatioReporter reporter;
     benchmark::RunSpecifiedBenchmarks(&reporter);
     benchmark::Shutdown();
