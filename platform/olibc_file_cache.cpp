@@ -38,7 +38,7 @@ SectionFile::~SectionFile() {
 void SectionFile::Parse(std::string data) {
     data_ = std::move(data);
     sections_.clear();
-    firstByName_.clear();
+    byName_.clear();
     for (POLIBC_SZHASH h : hashes_) OLIBCSzHashFree(h);
     hashes_.clear();
     indexes_.clear();
@@ -58,19 +58,28 @@ void SectionFile::Parse(std::string data) {
     std::vector<Header> headers;
     ScanHeaders(data_, &headers);
     sections_.reserve(headers.size());
-    firstByName_.reserve(headers.size());
+    size_t slots = 1;
+    while (slots < 2 * headers.size()) slots *= 2;
+    byName_.assign(slots, 0);
     for (size_t i = 0; i < headers.size(); ++i) {
         const Header &h = headers[i];
         Section s{};
         s.badHeader = h.name.empty();
         s.nameOff = s.badHeader ? 0 : Store(h.name);
+        s.nameDataOff = static_cast<uint32_t>(h.name.data() - data_.data());
         s.nameLen = static_cast<uint32_t>(h.name.size());
         s.bodyBegin = static_cast<uint32_t>(h.end);
         s.bodyEnd = static_cast<uint32_t>(BodyEnd(headers, i, data_.size()));
         hasBadHeader_ = hasBadHeader_ || s.badHeader;
         hasNulInName_ = hasNulInName_ || h.name.find('\0') != std::string_view::npos;
-        if (!s.badHeader) s.firstOfName = firstByName_.emplace(h.name, static_cast<uint32_t>(i)).second;
         sections_.push_back(s);
+        if (s.badHeader) continue;
+        size_t k = SlotOf(h.name);
+        while (byName_[k] != 0 && NameInData(byName_[k] - 1) != h.name) k = (k + 1) & (byName_.size() - 1);
+        if (byName_[k] == 0) {
+            byName_[k] = static_cast<uint32_t>(i + 1);
+            sections_.back().firstOfName = true;
+        }
     }
     hashes_.assign(sections_.size(), nullptr);
 }
@@ -105,8 +114,12 @@ const SectionFile::Section &SectionFile::Body(size_t i) const {
 }
 
 long SectionFile::Find(std::string_view name) const {
-    auto it = firstByName_.find(name);
-    return it == firstByName_.end() ? -1 : static_cast<long>(it->second);
+    if (byName_.empty()) return -1;
+    for (size_t k = SlotOf(name);; k = (k + 1) & (byName_.size() - 1)) {
+        const uint32_t v = byName_[k];
+        if (v == 0) return -1;
+        if (NameInData(v - 1) == name) return static_cast<long>(v - 1);
+    }
 }
 
 const char *SectionFile::ValueOf(size_t i, const char *key) const {
@@ -254,13 +267,20 @@ struct Entry {
     std::string mapped;  // the path as the seam maps it: a new sandbox root is a new file
     Identity id;
     bool racy = false;
-    std::shared_ptr<const SectionFile> file;
+    std::shared_ptr<SectionFile> file;
 };
 
 // Most recently used first.
 thread_local std::vector<Entry> tlsEntries;
 
-std::shared_ptr<const SectionFile> ParseImage(FileImage *image) {
+// Called before an entry is dropped: a parse nobody else holds gives its image's buffer
+// to the next read (a writer drops the parse of the file it replaced, and the next read
+// of that file needs a buffer of the same size).
+void Recycle(Entry &e) {
+    if (e.file != nullptr && e.file.use_count() == 1) e.file->GiveBackImage();
+}
+
+std::shared_ptr<SectionFile> ParseImage(FileImage *image) {
     auto file = std::make_shared<SectionFile>();
     file->Parse(std::move(image->data));
     SectionStatsAdd(file->Count(), 0);
@@ -286,7 +306,10 @@ std::shared_ptr<const SectionFile> Load(const char *path) {
     const struct timespec readStart = Now();
     FileImage image;
     if (ReadImage(path, &image, false) != 0) {
-        if (it != tlsEntries.end()) tlsEntries.erase(it);
+        if (it != tlsEntries.end()) {
+            Recycle(*it);
+            tlsEntries.erase(it);
+        }
         return nullptr;
     }
     const Identity id = IdentityOf(image.st);
@@ -299,9 +322,15 @@ std::shared_ptr<const SectionFile> Load(const char *path) {
         std::rotate(tlsEntries.begin(), it, it + 1);
         return tlsEntries.front().file;
     }
-    std::shared_ptr<const SectionFile> file = ParseImage(&image);
-    if (it != tlsEntries.end()) tlsEntries.erase(it);
-    if (tlsEntries.size() >= kSectionFileCacheSize) tlsEntries.pop_back();
+    std::shared_ptr<SectionFile> file = ParseImage(&image);
+    if (it != tlsEntries.end()) {
+        Recycle(*it);
+        tlsEntries.erase(it);
+    }
+    if (tlsEntries.size() >= kSectionFileCacheSize) {
+        Recycle(tlsEntries.back());
+        tlsEntries.pop_back();
+    }
     Entry entry;
     entry.mapped = std::move(mapped);
     entry.id = id;
@@ -334,7 +363,11 @@ void SectionFileForget(const char *path) {
     try {
         std::string mapped = os::Map(path);
         tlsEntries.erase(std::remove_if(tlsEntries.begin(), tlsEntries.end(),
-                                        [&mapped](const Entry &e) { return e.mapped == mapped; }),
+                                        [&mapped](Entry &e) {
+                                            if (e.mapped != mapped) return false;
+                                            Recycle(e);
+                                            return true;
+                                        }),
                          tlsEntries.end());
     } catch (const std::bad_alloc &) {
         tlsEntries.clear();  // cannot tell which: forget them all

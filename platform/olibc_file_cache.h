@@ -38,12 +38,14 @@
 #include <cstring>
 #include <memory>
 #include <string>
+#include <functional>
 #include <string_view>
 #include <unordered_map>
 #include <utility>
 #include <vector>
 
 #include "olibc.h"
+#include "platform/olibc_file_internal.h"
 
 namespace orlo {
 namespace olibc {
@@ -67,6 +69,9 @@ class SectionFile {
     void Parse(std::string data);
 
     const std::string &Data() const { return data_; }
+    // Hands the image's buffer over for the next whole-file read (KeepImageBuffer).  For
+    // the cache alone, as it drops the last reference to a parse: the parse is empty after.
+    void GiveBackImage() { KeepImageBuffer(&data_); }
     // Header lines, in file order.
     size_t Count() const { return sections_.size(); }
     // The name (NUL-terminated, so cut at a NUL byte it may hold; "" for a malformed
@@ -120,7 +125,8 @@ class SectionFile {
 
   private:
     struct Section {
-        uint32_t nameOff;
+        uint32_t nameOff;      // in strings_
+        uint32_t nameDataOff;  // in data_
         uint32_t nameLen;
         uint32_t bodyBegin;  // the body's lines: [bodyBegin, bodyEnd) of data_
         uint32_t bodyEnd;
@@ -136,6 +142,12 @@ class SectionFile {
     const Section &Body(size_t i) const;
     // Copies s (up to a NUL byte in it) into strings_ with a terminating NUL; its offset.
     uint32_t Store(std::string_view s) const;
+    // The name of section i as the file holds it (NUL bytes included).
+    std::string_view NameInData(size_t i) const {
+        return std::string_view(data_).substr(sections_[i].nameDataOff, sections_[i].nameLen);
+    }
+    // Where the probe for name starts in byName_.
+    size_t SlotOf(std::string_view name) const { return std::hash<std::string_view>{}(name) & (byName_.size() - 1); }
 
     using Index = std::unordered_map<int64_t, std::vector<uint32_t>>;
 
@@ -146,7 +158,10 @@ class SectionFile {
     mutable size_t used_ = 0;
     size_t capacity_ = 0;
     mutable std::vector<Section> sections_;
-    std::unordered_map<std::string_view, uint32_t> firstByName_;  // names as data_ holds them
+    // The first section of each name: an open-addressing table (linear probing) whose
+    // slots hold a section's index + 1, or 0 when empty; a power of two at least twice
+    // the sections, so one allocation serves a file of any size.
+    std::vector<uint32_t> byName_;
     bool hasBadHeader_ = false;
     bool hasNulInName_ = false;
     mutable std::vector<POLIBC_SZHASH> hashes_;

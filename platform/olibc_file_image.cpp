@@ -3,9 +3,11 @@
 #include <fcntl.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <climits>
 #include <cstring>
+#include <new>
 
 #include "platform/olibc_file_internal.h"
 #include "platform/os_seam.h"
@@ -16,6 +18,13 @@ namespace olibc {
 namespace {
 
 bool IsBlank(char c) { return c == ' ' || c == '\t'; }
+
+constexpr size_t kKeptBufferMin = 64 * 1024;
+constexpr size_t kKeptBufferMax = 16 * 1024 * 1024;
+constexpr size_t kKeptBuffers = 2;
+// Only ever touched by explicit calls (never from the destructor of another thread-local
+// object), so its own destruction at thread exit comes after its last use.
+thread_local std::vector<std::string> tlsBuffers;
 
 bool HasLineBreak(const char *s) { return strpbrk(s, "\n\r") != nullptr; }
 
@@ -176,6 +185,43 @@ void ScanHeaders(std::string_view data, std::vector<Header> *headers) {
     }
 }
 
+std::string TakeImageBuffer(size_t size) {
+    std::string out;
+    if (tlsBuffers.empty()) return out;
+    // The smallest that fits, else the largest (it grows once).
+    size_t pick = 0;
+    for (size_t i = 1; i < tlsBuffers.size(); ++i) {
+        const size_t have = tlsBuffers[i].capacity(), best = tlsBuffers[pick].capacity();
+        if (best >= size ? (have >= size && have < best) : have > best) pick = i;
+    }
+    out.swap(tlsBuffers[pick]);
+    tlsBuffers.erase(tlsBuffers.begin() + static_cast<std::ptrdiff_t>(pick));
+    out.clear();
+    return out;
+}
+
+void KeepImageBuffer(std::string *buffer) {
+    const size_t capacity = buffer->capacity();
+    if (capacity < kKeptBufferMin || capacity > kKeptBufferMax) return;
+    if (tlsBuffers.size() >= kKeptBuffers) {
+        auto smallest = std::min_element(tlsBuffers.begin(), tlsBuffers.end(),
+                                         [](const std::string &a, const std::string &b) {
+                                             return a.capacity() < b.capacity();
+                                         });
+        if (smallest->capacity() >= capacity) return;
+        tlsBuffers.erase(smallest);
+    }
+    if (tlsBuffers.capacity() < kKeptBuffers) {
+        try {
+            tlsBuffers.reserve(kKeptBuffers);
+        } catch (const std::bad_alloc &) {
+            return;  // not kept, simply freed: called from destructors, so never throws
+        }
+    }
+    tlsBuffers.emplace_back();
+    tlsBuffers.back().swap(*buffer);
+}
+
 int CodeOfErrno(int err, int fallback) {
     switch (err) {
         case ENOENT:
@@ -216,6 +262,7 @@ int ReadImage(const char *path, FileImage *image, bool forWrite) {
     }
     // The size is a hint only: the file may be growing under a careless writer.
     size_t capacity = static_cast<size_t>(image->st.st_size) + 1;
+    if (image->data.capacity() < capacity) image->data = TakeImageBuffer(capacity);
     image->data.resize(capacity);
     size_t used = 0;
     for (;;) {
@@ -234,6 +281,10 @@ int ReadImage(const char *path, FileImage *image, bool forWrite) {
 }
 
 int ReplaceFile(const char *path, const struct stat *st, std::string_view content) {
+    return ReplaceFile(path, st, std::vector<std::string_view>{content});
+}
+
+int ReplaceFile(const char *path, const struct stat *st, const std::vector<std::string_view> &pieces) {
     std::string tmp = std::string(path) + ".XXXXXX";
     if (tmp.size() >= PATH_MAX) {
         errno = ENAMETOOLONG;
@@ -255,16 +306,18 @@ int ReplaceFile(const char *path, const struct stat *st, std::string_view conten
         OLIBCErrSet(code);
         return -1;
     };
-    const char *p = content.data();
-    size_t left = content.size();
-    while (left > 0) {
-        ssize_t n = write(fd, p, left);
-        if (n < 0) {
-            if (errno == EINTR) continue;
-            return fail(CodeOfErrno(errno, OLIBC_ERR_IO));
+    for (std::string_view piece : pieces) {
+        const char *p = piece.data();
+        size_t left = piece.size();
+        while (left > 0) {
+            ssize_t n = write(fd, p, left);
+            if (n < 0) {
+                if (errno == EINTR) continue;
+                return fail(CodeOfErrno(errno, OLIBC_ERR_IO));
+            }
+            p += n;
+            left -= static_cast<size_t>(n);
         }
-        p += n;
-        left -= static_cast<size_t>(n);
     }
     if (st != nullptr) {
         // Owner first: fchown clears set-id bits that fchmod then restores.
@@ -293,18 +346,26 @@ void AddEdit(std::vector<Edit> *edits, size_t begin, size_t end, std::string tex
     edits->push_back(Edit{begin, end, std::move(text)});
 }
 
-std::string ApplyEdits(std::string_view data, const std::vector<Edit> &edits) {
-    size_t size = data.size();
-    for (const Edit &e : edits) size = size - (e.end - e.begin) + e.text.size();
-    std::string out;
-    out.reserve(size);
+std::vector<std::string_view> EditedPieces(std::string_view data, const std::vector<Edit> &edits) {
+    std::vector<std::string_view> pieces;
+    pieces.reserve(2 * edits.size() + 1);
     size_t pos = 0;
     for (const Edit &e : edits) {
-        out.append(data.substr(pos, e.begin - pos));
-        out.append(e.text);
+        if (e.begin > pos) pieces.push_back(data.substr(pos, e.begin - pos));
+        if (!e.text.empty()) pieces.push_back(e.text);
         pos = e.end;
     }
-    out.append(data.substr(pos));
+    if (pos < data.size()) pieces.push_back(data.substr(pos));
+    return pieces;
+}
+
+std::string ApplyEdits(std::string_view data, const std::vector<Edit> &edits) {
+    const std::vector<std::string_view> pieces = EditedPieces(data, edits);
+    size_t size = 0;
+    for (std::string_view piece : pieces) size += piece.size();
+    std::string out;
+    out.reserve(size);
+    for (std::string_view piece : pieces) out.append(piece);
     return out;
 }
 

@@ -107,9 +107,21 @@ inline size_t BodyEnd(const std::vector<Header> &headers, size_t i, size_t size)
 }
 
 // ---- Whole files ----
+// Buffers of whole-file reads, kept per thread for the next read.  A buffer the size of
+// a large configuration file would otherwise come fresh from the kernel at each read and
+// be faulted in page by page, which costs more than the read itself; a writer that reads
+// a section and then rewrites the file needs two at a time, so two are kept.  Buffers
+// under 64 KiB are left to the allocator, those over 16 MiB are not kept.
+std::string TakeImageBuffer(size_t size);
+void KeepImageBuffer(std::string *buffer);
+
 struct FileImage {
     std::string data;
     struct stat st {};
+    FileImage() = default;
+    FileImage(const FileImage &) = delete;
+    FileImage &operator=(const FileImage &) = delete;
+    ~FileImage() { KeepImageBuffer(&data); }
 };
 
 // Reads a regular file whole.  forWrite also refuses a symbolic link at path (a writer
@@ -123,6 +135,9 @@ int ReadImage(const char *path, FileImage *image, bool forWrite);
 // On failure the temporary file is removed and path is untouched.  0, or -1 with the
 // platform error set (OLIBC_ERR_NO_SPACE, OLIBC_ERR_IO, OLIBC_ERR_TOO_LONG, OLIBC_ERR_CONF).
 int ReplaceFile(const char *path, const struct stat *st, std::string_view content);
+// The same with the content given as pieces written one after another (an edited image
+// is written from the old image and the edits' texts, without building it first).
+int ReplaceFile(const char *path, const struct stat *st, const std::vector<std::string_view> &pieces);
 
 // A change to an image: bytes [begin, end) become text (an insertion when begin == end).
 struct Edit {
@@ -134,6 +149,9 @@ struct Edit {
 void AddEdit(std::vector<Edit> *edits, size_t begin, size_t end, std::string text = std::string());
 // The image with every edit applied (edits in ascending, non-overlapping order).
 std::string ApplyEdits(std::string_view data, const std::vector<Edit> &edits);
+// The same as the pieces that make it up, in order: stretches of data and edit texts
+// (views into data and edits, valid while both are).
+std::vector<std::string_view> EditedPieces(std::string_view data, const std::vector<Edit> &edits);
 // Whether ApplyEdits(data, edits) would be data again, found without building it: the
 // section writers leave a file alone rather than write the same bytes.
 bool ChangesNothing(std::string_view data, const std::vector<Edit> &edits);

@@ -77,7 +77,7 @@ int BadParam() {
 // that readers hold.  0, or -1 with the platform error set.
 int WriteEdited(const char *path, const FileImage &image, const struct stat *st, const std::vector<Edit> &edits) {
     if (orlo::olibc::ChangesNothing(image.data, edits)) return 0;
-    if (orlo::olibc::ReplaceFile(path, st, orlo::olibc::ApplyEdits(image.data, edits)) != 0) return -1;
+    if (orlo::olibc::ReplaceFile(path, st, orlo::olibc::EditedPieces(image.data, edits)) != 0) return -1;
     orlo::olibc::SectionFileForget(path);
     return 0;
 }

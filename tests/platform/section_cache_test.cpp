@@ -11,6 +11,7 @@
 #include <unistd.h>
 
 #include <cstdio>
+#include <cstring>
 #include <string>
 #include <thread>
 #include <utility>
@@ -331,6 +332,61 @@ TEST_F(SectionCacheTest, KeyLinesParsedAtFirstUseReadAlikeInAnyOrder) {
     // without its newline.
     WriteFile(kConf, "[t\na=1\nb=2\nc=3");
     EXPECT_EQ((Pairs{{"a", "1"}, {"b", "2"}, {"c", "3"}}), Get("t"));
+}
+
+// Whole-file reads reuse the buffers of earlier ones (a writer's image, a parse the cache
+// dropped): a read never shows bytes of another file or of an earlier version, and a
+// parse someone still holds keeps its image when the cache lets go of it.
+TEST_F(SectionCacheTest, ReusedReadBuffersNeverShowOtherBytes) {
+    auto sections = [](const std::string &prefix, int n, const std::string &value) {
+        std::string text;
+        for (int i = 0; i < n; ++i) text += "[" + prefix + std::to_string(i) + "]\n\tk=" + value + std::to_string(i) + "\n";
+        return text;
+    };
+    const std::string big = sections("s", 4000, "big-value-");  // well over the buffers kept
+    WriteFile(kConf, big);
+    EXPECT_EQ((Pairs{{"k", "big-value-3999"}}), Get("s3999"));
+    std::shared_ptr<const orlo::olibc::SectionFile> held = orlo::olibc::SectionFileLoad(kConf);
+    ASSERT_NE(nullptr, held);
+
+    // A writer replaces the file and drops the cache's parse; the one held here stays whole.
+    POLIBC_SZHASH h = MakeHash({{"k", "new"}});
+    ASSERT_EQ(1, OLIBCFileSetSection(kConf, "s0", "s0", h, "\t%s=%s\n"));
+    EXPECT_TRUE(held->Data() == big) << "the held parse lost its image";
+    long i = held->Find("s2500");
+    ASSERT_GE(i, 0);
+    EXPECT_STREQ("big-value-2500", held->ValueOf(static_cast<size_t>(i), "k"));
+    EXPECT_EQ((Pairs{{"k", "new"}}), Get("s0"));
+    held.reset();
+    ASSERT_EQ(1, OLIBCFileSetSection(kConf, "s1", "s1", h, "\t%s=%s\n"));
+    OLIBCSzHashFree(h);
+
+    // Smaller files after the big ones: exactly their own bytes, whichever buffer they got.
+    const char *mid = "/usr/orlo/etc/mid.conf";
+    const std::string midText = sections("m", 3000, "") + "[tail]\n\tend=z";  // no final newline
+    WriteFile(mid, midText);
+    for (int round = 0; round < 2; ++round) {
+        SCOPED_TRACE(round);
+        std::vector<std::string> names = Enum(mid);
+        ASSERT_EQ(3001u, names.size());
+        EXPECT_EQ("tail", names.back());
+        EXPECT_EQ((Pairs{{"end", "z"}}), Get("tail", mid));
+        orlo::olibc::FileImage image;
+        ASSERT_EQ(0, orlo::olibc::ReadImage(mid, &image, false));
+        EXPECT_TRUE(image.data == midText) << image.data.size() << " bytes read of " << midText.size();
+        orlo::olibc::SectionFileCacheClear();
+    }
+    const char *small = "/usr/orlo/etc/small.conf";
+    WriteFile(small, "[only]\n\tk=1\n");
+    EXPECT_EQ((std::vector<std::string>{"only"}), Enum(small));
+    char value[16];
+    EXPECT_EQ(1, OLIBCFileGetSectionValue(small, "only", "k", value, sizeof(value)));
+    ASSERT_EQ(0, OLIBCFileSetSectionValue(small, "only", "k", "2", "\t%s=%s\n"));
+    EXPECT_EQ("[only]\n\tk=2\n", ReadFile(small));
+    std::string rewritten = big;
+    for (const char *line : {"\tk=big-value-0\n", "\tk=big-value-1\n"})
+        rewritten.replace(rewritten.find(line), strlen(line), "\tk=new\n");
+    EXPECT_TRUE(ReadFile(kConf) == rewritten);
 }
 
 TEST_F(SectionCacheTest, WritingTheSameBytesLeavesTheFileAsItIs) {
