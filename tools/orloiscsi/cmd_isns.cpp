@@ -77,7 +77,13 @@ void RegisterIsns(CLI::App *root) {
     AddAction(obj, "refresh",
               "register every running target again, renewing the registrations (run it more often than half "
               "the server's registration period)",
-              [] { return RunStep(ORLOiSCSIiSNSRefresh, "registrations renewed"); });
+              [] {
+                  if (!ORLOiSCSIiSNSIsEnabled()) {
+                      printf("iSNS is off: nothing to renew\n");
+                      return 0;
+                  }
+                  return RunStep(ORLOiSCSIiSNSRefresh, "registrations renewed");
+              });
 }
 
 }  // namespace cli
