@@ -192,6 +192,7 @@ void RegisterLun(CLI::App *root);
 void RegisterTarget(CLI::App *root);
 void RegisterMap(CLI::App *root);
 void RegisterAcl(CLI::App *root);
+void RegisterSnapshot(CLI::App *root);
 void RegisterEp(CLI::App *root);
 void RegisterService(CLI::App *root);  // service, modules, selftest
 void RegisterConf(CLI::App *root);

@@ -109,6 +109,7 @@ int main(int argc, char **argv) {
     RegisterTarget(&app);
     RegisterMap(&app);
     RegisterAcl(&app);
+    RegisterSnapshot(&app);
     RegisterEp(&app);
     RegisterService(&app);
     RegisterIsns(&app);
