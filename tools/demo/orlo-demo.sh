@@ -3,9 +3,10 @@
 # a fresh appliance root with a tmpfs data volume and the simulated kernel target, the
 # service started, LUNs of two kinds, a CHAP target with an access list and mappings,
 # status and sessions, a stop and a start that rebuilds the kernel tree from the files,
-# and a total stop.  Every step is printed as the command a person would type, then its
-# output.  Whatever happens (a failing step, Ctrl-C, SIGTERM) nothing stays mounted or
-# running and the root is removed.
+# a snapshot taken, held against deletion, released and deleted, and a total stop.
+# Every step is printed as the command a person would type, then its output.  Whatever
+# happens (a failing step, Ctrl-C, SIGTERM) nothing stays mounted or running and the
+# root is removed.
 #
 #   tools/demo/orlo-demo.sh [BINDIR]      (BINDIR: where orloiscsi and the simulator are;
 #                                          build/bin by default)
@@ -130,9 +131,10 @@ printf '$ ROOT=$(mktemp -d /tmp/orlo-demo.XXXXXX)    # %s\n\n' "$ROOT"
 run 'mkdir $ROOT/volume1 $ROOT/config'
 run 'mount -t tmpfs -o size=1G tmpfs $ROOT/volume1                # the data volume /volume1'
 echo '# The kernel target, simulated: mounted at /config, with its module files and an'
-echo '# insmod that hands them to it.'
-printf '$ orlo-configfs-sim --root $ROOT $ROOT/config &\n'
-orlo-configfs-sim --root "$ROOT" "$ROOT/config" &
+echo '# insmod that hands them to it.  Its clones advance 50% a second, as a small LUN'"'"'s'
+echo '# would on the appliance.'
+printf '$ orlo-configfs-sim --clone-rate 50 --root $ROOT $ROOT/config &\n'
+orlo-configfs-sim --clone-rate 50 --root "$ROOT" "$ROOT/config" &
 SIM_PID=$!
 for _ in $(seq 100); do [ -d "$ROOT/config/.sim" ] && break; sleep 0.05; done
 [ -d "$ROOT/config/.sim" ] || { echo "orlo-demo: the simulator did not come up" >&2; FAILED=1; exit 1; }
@@ -175,6 +177,19 @@ run 'echo "target nodes in the kernel: $(ls $ROOT/config/target/iscsi | wc -l)"'
 run 'orloiscsi --root $ROOT service start'
 run 'orloiscsi --root $ROOT target status demo'
 run 'ls $ROOT/config/target/iscsi/iqn.2000-01.com.orlo-nas:demo/tpgt_1/lun'
+
+step "Snapshots"
+echo '# The kernel clones the advanced LUN into the snapshot while the LUN stays online;'
+echo '# --wait waits until the clone is done and the snapshot Healthy.'
+run 'orloiscsi --root $ROOT snapshot create pool --name before-upgrade --note "taken by the demo" --wait'
+run 'orloiscsi --root $ROOT snapshot list'
+echo '# Backup software holds the snapshot with its key: deleting it is refused meanwhile.'
+run 'orloiscsi --root $ROOT snapshot hold pool before-upgrade backup-app'
+run 'orloiscsi --root $ROOT snapshot list pool'
+refused 'orloiscsi --root $ROOT snapshot delete pool before-upgrade'
+run 'orloiscsi --root $ROOT snapshot release pool before-upgrade backup-app'
+run 'orloiscsi --root $ROOT snapshot delete pool before-upgrade'
+run 'orloiscsi --root $ROOT snapshot list pool'
 
 step "Two services talking through the messaging engine"
 run 'orlocommd --root $ROOT                                     # the engine: FIFOs under /tmp, TCP port 3262'
