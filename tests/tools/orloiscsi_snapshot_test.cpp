@@ -145,10 +145,12 @@ TEST_F(OrloiscsiSnapshot, BlockSnapshotsTakenListedHeldRefusedReleasedAndDeleted
     EXPECT_TRUE(std::regex_search(out, std::regex("^took snapshot 1 'before upgrade' of LUN 'blk', uuid [0-9a-f-]{36}: "
                                                   "Healthy\n$")))
         << out;
-    ASSERT_EQ(0, RunProgram({"/usr/bin/env", "-i", Prefix()[0], "--root", root(), "snapshot", "create", "blk"}, &out,
-                            &err))
+    ASSERT_EQ(0, RunProgram({"/usr/bin/env", "-i", Prefix()[0], "--root", root(), "snapshot", "create", "blk",
+                             "--wait", "--progress"},
+                            &out, &err))
         << err;
     EXPECT_TRUE(Has(out, "took snapshot 2 'SnapShot-1' of LUN 'blk'")) << out;
+    EXPECT_EQ("", err) << "a block-level snapshot is done at once: no clone to wait for";
 
     JsonDoc list = CliJson({"snapshot", "list", "blk"});
     ASSERT_TRUE(list);

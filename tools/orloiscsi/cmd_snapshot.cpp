@@ -372,8 +372,10 @@ int RunCreate(const SnapArgs &a) {
     ret = ORLOiSCSISnapshotCreate(&lun, &f.snap);
     if (ret != ORLO_OK) return Fail(ret);
 
+    // A block-level snapshot (and an application-consistent advanced one) is done on
+    // return; an advanced one is finished by the background process.
     bool background = strcmp(f.snap.status, "Healthy") != 0;
-    if (a.wait) {
+    if (a.wait && background) {
         int rc = WaitForClone(&f, a.progress || isatty(STDERR_FILENO));
         if (rc != 0) return rc;
         background = false;
