@@ -124,6 +124,17 @@ extern "C" ORLO_EXPORT uint32_t ORLOiSCSISnapshotDelete(ORLOiSCSISnapshot *snap,
             ret = sn::kErrRmdir;
         }
     }
+    if (ret == ORLO_OK) {
+        // A deleted snapshot has nothing left to hold or lock: its key file and its lock
+        // file go (the lock file while still held), so that files named after UUIDs do
+        // not pile up under /tmp/iscsi.
+        char path[sn::kRuntimePathSize];
+        if (sn::AppKeyPath(snap, path, sizeof(path)) == ORLO_OK && orlo::os::Unlink(path) != 0 && errno != ENOENT)
+            ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", path);
+        if (snap->lock_fd > 0 && sn::OpLockPath(snap, path, sizeof(path)) == ORLO_OK && orlo::os::Unlink(path) != 0 &&
+            errno != ENOENT)
+            ORLO_LOG_ERR("unlink(\"%s\") failed, err=%m", path);
+    }
     if (ret != ORLO_OK) {
         ORLO_LOG_ERR("Failed to delete snapshot. name: %s.", snap->name);
         std::string text = std::string("Failed to delete snapshot ") + snap->name;

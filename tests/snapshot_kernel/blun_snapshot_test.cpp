@@ -149,6 +149,8 @@ TEST_F(BlunSnapshotTest, ASnapshotIsAReadOnlySubvolumeOfThatMomentRecordedTwice)
     EXPECT_TRUE(Exists(Subvol(lun, s)));
     EXPECT_EQ(0u, ORLOiSCSISnapshotDeleteWithoutCheckingAppKey(&s, nullptr)) << log_.Dump();
     EXPECT_FALSE(Exists(Subvol(lun, s)));
+    EXPECT_FALSE(Exists(std::string("/tmp/iscsi/snapshot_app_lock/SN_") + s.uuid + ".app.lock"));
+    EXPECT_FALSE(Exists(std::string("/tmp/iscsi/snapshot_lock/SN_") + s.uuid + ".lock"));
     EXPECT_EQ(18990532u, ORLOiSCSISnapshotConfGetByUuid(s.uuid, &fromCache));
     EXPECT_TRUE(Exists(std::string("/volume1/@iSCSI/Snapshot/BLUN/") + lun.uuid)) << "one snapshot is left";
 
