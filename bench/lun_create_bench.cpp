@@ -18,6 +18,7 @@
 #include <string>
 #include <vector>
 
+#include "bench_nth.h"
 #include "orloiscsi_base.h"
 #include "orloiscsi_lun.h"
 
@@ -33,12 +34,6 @@ ORLOiSCSILun NewLun(const std::string &name) {
     snprintf(lun.name, sizeof(lun.name), "%s", name.c_str());
     snprintf(lun.rootPath, sizeof(lun.rootPath), "/volume1");
     return lun;
-}
-
-double Now() {
-    struct timespec ts;
-    clock_gettime(CLOCK_MONOTONIC, &ts);
-    return static_cast<double>(ts.tv_sec) + static_cast<double>(ts.tv_nsec) / 1e9;
 }
 
 // A sandbox root with a mounted volume and a growing number of LUNs.
@@ -97,7 +92,7 @@ class Appliance {
 };
 
 Appliance *gAppliance = nullptr;
-std::map<int, double> gMedianSeconds;
+orlobench::NthMedians gMedians;
 
 // Creates the n-th LUN (n - 1 are there), and takes it away again outside the timing.
 void BM_CreateNthLun(benchmark::State &state) {
@@ -109,12 +104,7 @@ void BM_CreateNthLun(benchmark::State &state) {
     std::vector<double> times;
     for (auto _ : state) {
         ORLOiSCSILun lun = NewLun("bench-" + std::to_string(n));
-        const double start = Now();
-        const uint32_t ret = ORLOiSCSILunCreate(&lun);
-        const double elapsed = Now() - start;
-        state.SetIterationTime(elapsed);
-        times.push_back(elapsed);
-        if (ret != 0 || lun.lid != n) {
+        if (!gMedians.Time(state, &times, [&] { return ORLOiSCSILunCreate(&lun) == 0; }) || lun.lid != n) {
             state.SkipWithError("creation failed");
             return;
         }
@@ -123,8 +113,7 @@ void BM_CreateNthLun(benchmark::State &state) {
             return;
         }
     }
-    std::sort(times.begin(), times.end());
-    gMedianSeconds[n] = times[times.size() / 2];
+    gMedians.Keep(n, times);
     state.counters["luns_before"] = n - 1;
 }
 BENCHMARK(BM_CreateNthLun)->Arg(1)->Arg(256)->Arg(1024)->Iterations(30)->UseManualTime()->Unit(benchmark::kMillisecond);
@@ -143,12 +132,6 @@ int main(int argc, char **argv) {
     benchmark::RunSpecifiedBenchmarks();
     benchmark::Shutdown();
     gAppliance = nullptr;
-    if (gMedianSeconds.count(1) != 0) {
-        const double first = gMedianSeconds[1];
-        printf("\nmedian time to create the n-th LUN:\n");
-        for (const auto &m : gMedianSeconds)
-            printf("  n=%4d  %8.3f ms  %5.2f x the 1st%s\n", m.first, m.second * 1e3, m.second / first,
-                   m.first == 1024 ? (m.second <= 3 * first ? "  (within 3x)" : "  (above 3x)") : "");
-    }
+    gMedians.Print("create the n-th LUN", 1024, 3.0);
     return 0;
 }

@@ -17,17 +17,12 @@
 #include <string>
 #include <vector>
 
+#include "bench_nth.h"
 #include "orloiscsi_base.h"
 #include "orloiscsi_lun.h"
 #include "orloiscsi_snapshot.h"
 
 namespace {
-
-double Now() {
-    struct timespec ts;
-    clock_gettime(CLOCK_MONOTONIC, &ts);
-    return static_cast<double>(ts.tv_sec) + static_cast<double>(ts.tv_nsec) / 1e9;
-}
 
 ORLOiSCSISnapshot Request(const std::string &name) {
     ORLOiSCSISnapshot s;
@@ -90,7 +85,7 @@ class Appliance {
 };
 
 Appliance *gAppliance = nullptr;
-std::map<int, double> gMedianSeconds;
+orlobench::NthMedians gMedians;
 
 // Takes the n-th snapshot (n - 1 are there) and deletes it again outside the timing.
 void BM_TakeNthSnapshot(benchmark::State &state) {
@@ -102,18 +97,13 @@ void BM_TakeNthSnapshot(benchmark::State &state) {
     std::vector<double> times;
     for (auto _ : state) {
         ORLOiSCSISnapshot s = Request("bench-" + std::to_string(n));
-        const double start = Now();
-        const uint32_t ret = ORLOiSCSISnapshotCreate(gAppliance->lun(), &s);
-        const double elapsed = Now() - start;
-        state.SetIterationTime(elapsed);
-        times.push_back(elapsed);
-        if (ret != 0 || s.sid != n || ORLOiSCSISnapshotDelete(&s, nullptr) != 0) {
+        const bool made = gMedians.Time(state, &times, [&] { return ORLOiSCSISnapshotCreate(gAppliance->lun(), &s) == 0; });
+        if (!made || s.sid != n || ORLOiSCSISnapshotDelete(&s, nullptr) != 0) {
             state.SkipWithError("taking or deleting the snapshot failed");
             return;
         }
     }
-    std::sort(times.begin(), times.end());
-    gMedianSeconds[n] = times[times.size() / 2];
+    gMedians.Keep(n, times);
     state.counters["snapshots_before"] = n - 1;
 }
 BENCHMARK(BM_TakeNthSnapshot)->Arg(1)->Arg(128)->Arg(256)->Iterations(20)->UseManualTime()->Unit(benchmark::kMillisecond);
@@ -132,12 +122,6 @@ int main(int argc, char **argv) {
     benchmark::RunSpecifiedBenchmarks();
     benchmark::Shutdown();
     gAppliance = nullptr;
-    if (gMedianSeconds.count(1) != 0) {
-        const double first = gMedianSeconds[1];
-        printf("\nmedian time to take the n-th snapshot of one LUN:\n");
-        for (const auto &m : gMedianSeconds)
-            printf("  n=%4d  %8.3f ms  %5.2f x the 1st%s\n", m.first, m.second * 1e3, m.second / first,
-                   m.first == 256 ? (m.second <= 3 * first ? "  (within 3x)" : "  (above 3x)") : "");
-    }
+    gMedians.Print("take the n-th snapshot of one LUN", 256, 3.0);
     return 0;
 }
